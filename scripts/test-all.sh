@@ -1,0 +1,35 @@
+#!/usr/bin/env bash
+# Builds and runs every test: the plain build (C++ and JVM suites), the C++
+# suites under AddressSanitizer + UndefinedBehaviorSanitizer, and the threaded
+# suites under ThreadSanitizer. Fails on any failing test or sanitizer report.
+set -euo pipefail
+root=$(cd "$(dirname "$0")/.." && pwd)
+bash "$root/scripts/install-deps.sh"
+
+export JAVA_HOME=/usr/lib/jvm/java-17-openjdk-$(dpkg --print-architecture)
+jobs=$(nproc)
+
+build() {  # build <dir> <cmake args...>
+  local dir=$1; shift
+  cmake -S "$root" -B "$root/build/$dir" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo "$@" >/dev/null
+  cmake --build "$root/build/$dir" -j "$jobs"
+}
+
+step() { echo; echo "=== $* ==="; }
+
+step "build and test (gcc, -Wall -Wextra -Werror)"
+build main
+ctest --test-dir "$root/build/main" --output-on-failure -j "$jobs"
+
+step "C++ suites under AddressSanitizer + UndefinedBehaviorSanitizer"
+build asan -DHALVENOR_SANITIZE=address -DHALVENOR_JAVA=OFF
+ASAN_OPTIONS=detect_leaks=1:abort_on_error=1 UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
+  ctest --test-dir "$root/build/asan" --output-on-failure -j "$jobs" -L cxx
+
+step "threaded suites under ThreadSanitizer"
+build tsan -DHALVENOR_SANITIZE=thread -DHALVENOR_JAVA=OFF
+TSAN_OPTIONS="halt_on_error=1 second_deadlock_stack=1 suppressions=$root/tests/tsan.supp" \
+  ctest --test-dir "$root/build/tsan" --output-on-failure -j "$jobs" -L threaded
+
+echo
+echo "all test runs passed"

@@ -1,0 +1,92 @@
+// H4 framing and whole-run stream I/O shared by the pump (reads) and the HAL
+// callbacks (writes). Runs on whichever thread calls it.
+#include "transport/h4.h"
+
+#include <errno.h>
+#include <string.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include "transport/log.h"
+
+const int preamble_len_table[4] = {3, 4, 3, 2};
+
+int get_payload_len(uint8_t type, const uint8_t* preamble) {
+    switch (type) {
+        case H4_TYPE_COMMAND:
+        case H4_TYPE_SCO:
+            return preamble[2];
+        case H4_TYPE_ACL:
+            return preamble[2] | (preamble[3] << 8);
+        case H4_TYPE_EVENT:
+            return preamble[1];
+        default:
+            LOGE("%s: Unsupported packet type, failed to get length", "get_payload_len");
+            return -1;
+    }
+}
+
+int safe_read(int fd, unsigned char* buf, int len) {
+    if (buf == nullptr) {
+        LOGE("%s: The buffer is NULL", "safe_read");
+        return -1;
+    }
+    if (len == 0) {
+        LOGE("%s: No data to read", "safe_read");
+        return 0;
+    }
+    if (len < 0) return 0;
+
+    int done = 0;
+    while (done < len) {
+        ssize_t n = read(fd, buf + done, len - done);
+        if (n < 0 && errno == EINTR) continue;
+        if (n < 0) {
+            LOGE("%s: Read error: (%s)", "safe_read", strerror(errno));
+            return -1;
+        }
+        if (n == 0) {
+            LOGE("%s: read returned 0, err = %s, read bytes: %d", "safe_read", strerror(errno), done);
+            return -1;
+        }
+        done += static_cast<int>(n);
+    }
+    return len;
+}
+
+// A socket whose peer has gone must fail the write with EPIPE rather than
+// raise SIGPIPE and kill the host process; other descriptors take write().
+static ssize_t write_no_sigpipe(int fd, const unsigned char* buf, size_t len) {
+    ssize_t n = send(fd, buf, len, MSG_NOSIGNAL);
+    if (n < 0 && errno == ENOTSOCK) n = write(fd, buf, len);
+    return n;
+}
+
+int safe_write(int fd, unsigned char* buf, int len) {
+    if (buf == nullptr) {
+        LOGE("%s: The buffer is NULL", "safe_write");
+        return -1;
+    }
+    if (len == 0) {
+        LOGE("%s: No data to write", "safe_write");
+        return 0;
+    }
+    if (len < 0) return 0;
+
+    int done = 0;
+    while (done < len) {
+        ssize_t n = write_no_sigpipe(fd, buf + done, len - done);
+        if (n < 0 && errno == EINTR) continue;
+        if (n < 0) {
+            LOGE("%s: Write error: (%s)", "safe_write", strerror(errno));
+            return -1;
+        }
+        if (n == 0) {
+            LOGE("%s: Write returned 0, err = %s, bytes written: %d", "safe_write", strerror(errno),
+                 done);
+            return -1;
+        }
+        done += static_cast<int>(n);
+    }
+    return len;
+}
