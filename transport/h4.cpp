@@ -56,7 +56,7 @@ int safe_read(int fd, unsigned char* buf, int len) {
 
 // A socket whose peer has gone must fail the write with EPIPE rather than
 // raise SIGPIPE and kill the host process; other descriptors take write().
-static ssize_t write_no_sigpipe(int fd, const unsigned char* buf, size_t len) {
+ssize_t write_no_sigpipe(int fd, const unsigned char* buf, size_t len) {
     ssize_t n = send(fd, buf, len, MSG_NOSIGNAL);
     if (n < 0 && errno == ENOTSOCK) n = write(fd, buf, len);
     return n;

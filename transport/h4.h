@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <sys/types.h>
 
 enum {
     H4_TYPE_COMMAND = 1,
@@ -23,3 +24,7 @@ int get_payload_len(uint8_t type, const uint8_t* preamble);
 // Move exactly len bytes; len on success, 0 for len <= 0, -1 on failure.
 int safe_read(int fd, unsigned char* buf, int len);
 int safe_write(int fd, unsigned char* buf, int len);
+
+// One write() that fails with EPIPE rather than raising SIGPIPE when the peer
+// of a socket has gone; descriptors that are not sockets get a plain write().
+ssize_t write_no_sigpipe(int fd, const unsigned char* buf, size_t len);

@@ -28,6 +28,9 @@ FakeHal::Return<void> FakeHal::initialize(const sp<Callbacks>& callback) {
     } else if (mode_ == InitMode::Async) {
         std::lock_guard<std::mutex> guard(lock_);
         FakeHal::Status status = status_;
+        // Earlier answers have long finished; reap them so cycles don't pile up threads.
+        for (auto& t : threads_) t.join();
+        threads_.clear();
         threads_.emplace_back([callback, status] { callback->initializationComplete(status); });
     }
     return Void();

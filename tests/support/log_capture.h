@@ -2,6 +2,8 @@
 // logger hook, so tests can assert on log lines.
 #pragma once
 
+#include <android/log.h>
+
 #include <string>
 #include <vector>
 
