@@ -1,0 +1,114 @@
+// Test fixture base for suites that run the engine over a real HAL session: a
+// FakeHal registered as "default" that answers each command as the test's
+// script says (a Command Complete with status 0 unless told otherwise), and a
+// teardown that ends whatever session the test left open.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <cstdint>
+#include <functional>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "tests/support/fake_hal.h"
+#include "tests/support/log_capture.h"
+#include "transport/session.h"
+
+using Bytes = std::vector<uint8_t>;
+
+inline uint16_t opcodeOf(const Bytes& command) {
+    return command.size() < 2 ? 0 : static_cast<uint16_t>(command[0] | (command[1] << 8));
+}
+
+// Command Complete for opcode: one credit, the opcode, then the return parameters.
+inline Bytes commandComplete(uint16_t opcode, const Bytes& returned = {0x00}) {
+    Bytes event = {0x0E, static_cast<uint8_t>(3 + returned.size()), 0x01,
+                   static_cast<uint8_t>(opcode & 0xFF), static_cast<uint8_t>(opcode >> 8)};
+    event.insert(event.end(), returned.begin(), returned.end());
+    return event;
+}
+
+inline Bytes commandStatus(uint16_t opcode, uint8_t status) {
+    return {0x0F, 0x04, status, 0x01, static_cast<uint8_t>(opcode & 0xFF),
+            static_cast<uint8_t>(opcode >> 8)};
+}
+
+// The HCI commands (without H4 type byte) that reached the HAL, in order.
+inline std::vector<Bytes> commandsSent(FakeHal& hal) {
+    std::vector<Bytes> commands;
+    for (const SentPacket& p : hal.sent()) {
+        if (p.type == 1) commands.push_back(p.bytes);
+    }
+    return commands;
+}
+
+class HalSessionTest : public ::testing::Test {
+  protected:
+    using Script = std::function<std::vector<Bytes>(const Bytes& command)>;
+
+    void SetUp() override {
+        hal_ = new FakeHal();
+        hal_->onSend = [this](FakeHal& hal, const SentPacket& packet) {
+            for (const Bytes& event : replyTo(packet.bytes)) hal.deliverEvent(event);
+        };
+        hal_->registerDefault();
+        log_.clear();
+    }
+
+    void TearDown() override {
+        hidl_client_close_tool_end();
+        hidl_client_close();
+        FakeHal::unregisterDefault();
+    }
+
+    // "default" becomes a HAL whose initialisation fails: no session can open.
+    void withoutController() {
+        unusable_ = new FakeHal(FakeHal::InitMode::Sync, FakeHal::Status::INITIALIZATION_ERROR);
+        unusable_->registerDefault();
+    }
+
+    // Replaces how the HAL answers; set it before the session opens.
+    void answerWith(Script script) {
+        std::lock_guard<std::mutex> guard(lock_);
+        script_ = std::move(script);
+    }
+
+    std::vector<Bytes> replyTo(const Bytes& command) {
+        std::lock_guard<std::mutex> guard(lock_);
+        if (script_) return script_(command);
+        return {commandComplete(opcodeOf(command))};
+    }
+
+    // The log of the calling thread: without the lines that the pump logs on
+    // its own thread at the same time.
+    std::vector<std::string> engineLog() const {
+        static const char* const kPumpPrefixes[] = {"process_tool_data", "PACKET_TYPE", "safe_read",
+                                                    "Process tool", "Quit test mode"};
+        std::vector<std::string> texts;
+        for (const LogLine& line : log_.lines()) {
+            bool pump = false;
+            for (const char* prefix : kPumpPrefixes) pump = pump || line.text.rfind(prefix, 0) == 0;
+            if (!pump) texts.push_back(line.text);
+        }
+        return texts;
+    }
+
+    // Index of the first line of engineLog() equal to text, or -1.
+    int lineIndex(const std::string& text) const {
+        std::vector<std::string> texts = engineLog();
+        for (size_t i = 0; i < texts.size(); ++i) {
+            if (texts[i] == text) return static_cast<int>(i);
+        }
+        return -1;
+    }
+
+    android::sp<FakeHal> hal_;
+    LogCapture log_;
+
+  private:
+    android::sp<FakeHal> unusable_;
+    std::mutex lock_;
+    Script script_;
+};
