@@ -1,13 +1,91 @@
-// Picks the controller behind IBluetoothHci "default" on a host. No host
-// controller is built yet: unregistered names have no service.
+// Picks the controller behind IBluetoothHci "default" on a host, from
+// HALVENOR_HCI: the simulated controller (default), H4 over a unix or TCP
+// socket or a serial line, or no service at all. Runs on the thread that calls getService.
+#include <stdlib.h>
+
+#include <string>
+
 #include <hidl/HostServices.h>
+
+#include "host/hal/h4_hci.h"
+#include "host/hal/host_log.h"
+#include "host/hal/sim_hci.h"
+
+using android::sp;
+using android::hardware::hidl_vec;
+using android::hardware::Return;
+using android::hardware::Void;
+using android::hardware::bluetooth::V1_0::IBluetoothHci;
+using android::hardware::bluetooth::V1_0::IBluetoothHciCallbacks;
+using android::hardware::bluetooth::V1_0::Status;
+
+namespace {
+
+// What getService hands out for a setting it cannot use: the library sees a
+// service whose initialisation fails, and logs that itself.
+class UnusableHci : public IBluetoothHci {
+  public:
+    Return<void> initialize(const sp<IBluetoothHciCallbacks>& callback) override {
+        callback->initializationComplete(Status::INITIALIZATION_ERROR);
+        return Void();
+    }
+    Return<void> sendHciCommand(const hidl_vec<uint8_t>&) override { return Void(); }
+    Return<void> sendAclData(const hidl_vec<uint8_t>&) override { return Void(); }
+    Return<void> sendScoData(const hidl_vec<uint8_t>&) override { return Void(); }
+    Return<void> close() override { return Void(); }
+};
+
+std::string env_or(const char* name, const char* fallback) {
+    const char* value = getenv(name);
+    return value != nullptr && value[0] != '\0' ? value : fallback;
+}
+
+bool parse_fraction(const std::string& text, double* out) {
+    char* end = nullptr;
+    double v = strtod(text.c_str(), &end);
+    if (end == text.c_str() || *end != '\0' || !(v >= 0.0 && v <= 1.0)) return false;
+    *out = v;
+    return true;
+}
+
+// HALVENOR_SIM_REFTX (1 on, 0 off; default on) and HALVENOR_SIM_LOSS (0..1).
+bool sim_settings(SimControllerSettings* settings) {
+    std::string reftx = env_or("HALVENOR_SIM_REFTX", "1");
+    std::string loss = env_or("HALVENOR_SIM_LOSS", "0");
+    if (reftx != "0" && reftx != "1") {
+        HLOGE("HALVENOR_SIM_REFTX=\"%s\": expected 0 or 1", reftx.c_str());
+        return false;
+    }
+    if (!parse_fraction(loss, &settings->loss)) {
+        HLOGE("HALVENOR_SIM_LOSS=\"%s\": expected a fraction from 0 to 1", loss.c_str());
+        return false;
+    }
+    settings->reference_tx = reftx == "1";
+    return true;
+}
+
+}  // namespace
 
 namespace android {
 namespace hardware {
 namespace host {
 
-sp<bluetooth::V1_0::IBluetoothHci> createDefaultBluetoothHci(const std::string& /*serviceName*/) {
-    return nullptr;
+sp<bluetooth::V1_0::IBluetoothHci> createDefaultBluetoothHci(const std::string& serviceName) {
+    if (serviceName != "default") return nullptr;
+    std::string value = env_or("HALVENOR_HCI", "sim");
+    if (value == "none") return nullptr;  // a device without a Bluetooth HAL
+    if (value == "sim") {
+        SimControllerSettings settings;
+        if (!sim_settings(&settings)) return new UnusableHci();
+        return create_sim_hci(settings);
+    }
+    H4Target target;
+    std::string why;
+    if (!parse_h4_target(value, &target, &why)) {
+        HLOGE("HALVENOR_HCI=\"%s\": %s", value.c_str(), why.c_str());
+        return new UnusableHci();
+    }
+    return create_h4_hci(target);
 }
 
 }  // namespace host

@@ -1,0 +1,102 @@
+// btsnoop writer: each record goes out in one write to a file opened with
+// O_APPEND, so captures of several backends, even of several processes, can
+// share a file. Any thread.
+#include "host/hal/btsnoop.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+#include <vector>
+
+#include "host/hal/h4_stream.h"
+#include "host/hal/host_log.h"
+
+// Microseconds from 0 AD (the btsnoop epoch) to the Unix epoch.
+static const uint64_t kBtsnoopEpochDelta = 0x00DCDDB30F2F8000ULL;
+static const uint32_t kDatalinkH4 = 1002;
+
+static void put32(std::vector<uint8_t>& out, uint32_t v) {
+    for (int shift = 24; shift >= 0; shift -= 8) out.push_back(static_cast<uint8_t>(v >> shift));
+}
+
+static void put64(std::vector<uint8_t>& out, uint64_t v) {
+    put32(out, static_cast<uint32_t>(v >> 32));
+    put32(out, static_cast<uint32_t>(v));
+}
+
+static bool write_all(int fd, const std::vector<uint8_t>& bytes) {
+    size_t done = 0;
+    while (done < bytes.size()) {
+        ssize_t n = write(fd, bytes.data() + done, bytes.size() - done);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) return false;
+        done += static_cast<size_t>(n);
+    }
+    return true;
+}
+
+// The 16-byte file header goes in only while the file is empty; the lock
+// keeps two openers from both writing it.
+static bool write_header_if_new(int fd) {
+    flock(fd, LOCK_EX);
+    struct stat st;
+    bool ok = fstat(fd, &st) == 0;
+    if (ok && st.st_size == 0) {
+        std::vector<uint8_t> header = {'b', 't', 's', 'n', 'o', 'o', 'p', 0};
+        put32(header, 1);  // version
+        put32(header, kDatalinkH4);
+        ok = write_all(fd, header);
+    }
+    flock(fd, LOCK_UN);
+    return ok;
+}
+
+std::shared_ptr<Btsnoop> Btsnoop::open(const std::string& path) {
+    int fd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+    if (fd == -1) {
+        HLOGE("btsnoop: cannot open %s: %s", path.c_str(), strerror(errno));
+        return nullptr;
+    }
+    if (!write_header_if_new(fd)) {
+        HLOGE("btsnoop: cannot write the header of %s: %s", path.c_str(), strerror(errno));
+        close(fd);
+        return nullptr;
+    }
+    return std::shared_ptr<Btsnoop>(new Btsnoop(fd));
+}
+
+std::shared_ptr<Btsnoop> Btsnoop::fromEnvironment() {
+    const char* path = getenv("HALVENOR_BTSNOOP");
+    if (path == nullptr || path[0] == '\0') return nullptr;
+    return open(path);
+}
+
+Btsnoop::~Btsnoop() { close(fd_); }
+
+void Btsnoop::record(uint8_t type, const uint8_t* packet, size_t len, bool received) {
+    struct timeval tv;
+    gettimeofday(&tv, nullptr);
+    uint64_t micros = static_cast<uint64_t>(tv.tv_sec) * 1000000ULL + tv.tv_usec + kBtsnoopEpochDelta;
+    // Flags: bit 0 direction (1 = received by the host), bit 1 command or event.
+    uint32_t flags = (received ? 1u : 0u) | (type == H4_COMMAND || type == H4_EVENT ? 2u : 0u);
+    uint32_t length = static_cast<uint32_t>(len + 1);
+
+    std::vector<uint8_t> rec;
+    rec.reserve(24 + length);
+    put32(rec, length);  // original length
+    put32(rec, length);  // included length
+    put32(rec, flags);
+    put32(rec, 0);  // cumulative drops
+    put64(rec, micros);
+    rec.push_back(type);
+    rec.insert(rec.end(), packet, packet + len);
+
+    std::lock_guard<std::mutex> guard(lock_);
+    if (!write_all(fd_, rec)) HLOGE("btsnoop: write failed: %s", strerror(errno));
+}

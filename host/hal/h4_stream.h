@@ -1,0 +1,50 @@
+// H4 reassembly: cuts a byte stream, however it was split into reads, into
+// whole packets. Pure (no I/O); one instance per stream, used by one thread.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <vector>
+
+enum : uint8_t {
+    H4_COMMAND = 1,
+    H4_ACL = 2,
+    H4_SCO = 3,
+    H4_EVENT = 4,
+};
+
+struct H4Packet {
+    uint8_t type;
+    std::vector<uint8_t> bytes;  // the HCI packet, without the type byte
+};
+
+class H4Stream {
+  public:
+    using Sink = std::function<void(const H4Packet&)>;
+
+    // Hands every packet completed by these bytes to sink, in stream order.
+    // Returns false on a type byte that is not 1..4: the stream cannot be
+    // resynchronised, so the caller ends it; badType() names the byte.
+    bool feed(const uint8_t* data, size_t len, const Sink& sink);
+    uint8_t badType() const { return bad_type_; }
+    // Bytes of a packet begun but not finished.
+    size_t pending() const { return packet_.bytes.size() + (state_ == State::TYPE ? 0 : 1); }
+    void reset();
+
+  private:
+    enum class State { TYPE, HEADER, PAYLOAD };
+    size_t takeType(const uint8_t* data);
+    size_t takeHeader(const uint8_t* data, size_t len);
+    size_t takePayload(const uint8_t* data, size_t len);
+
+    State state_ = State::TYPE;
+    H4Packet packet_{0, {}};
+    size_t want_ = 0;  // bytes the packet needs in all (header + payload)
+    uint8_t bad_type_ = 0;
+};
+
+// Header length of an H4 packet type, 0 for a type outside 1..4.
+size_t h4_header_len(uint8_t type);
+// Parameter/payload length from a whole header.
+size_t h4_payload_len(uint8_t type, const uint8_t* header);

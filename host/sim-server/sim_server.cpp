@@ -1,0 +1,147 @@
+// halvenor-sim's serving: accepts on the listener, and gives every connection
+// a thread with its own SimController on the one shared air; stopping shuts
+// the connections down and joins their threads.
+#include "host/sim-server/sim_server.h"
+
+#include <arpa/inet.h>
+#include <errno.h>
+#include <netinet/in.h>
+#include <netinet/tcp.h>
+#include <poll.h>
+#include <string.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <memory>
+#include <mutex>
+#include <thread>
+#include <vector>
+
+#include "host/hal/h4_io.h"
+#include "host/hal/h4_stream.h"
+#include "host/hal/host_log.h"
+
+static int listen_unix(const std::string& path, std::string* where) {
+    struct sockaddr_un addr = {};
+    if (path.size() >= sizeof(addr.sun_path)) {
+        HLOGE("halvenor-sim: socket path too long: %s", path.c_str());
+        return -1;
+    }
+    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    addr.sun_family = AF_UNIX;
+    memcpy(addr.sun_path, path.c_str(), path.size());
+    unlink(path.c_str());  // a socket left by an earlier run
+    if (fd == -1 || bind(fd, reinterpret_cast<sockaddr*>(&addr), sizeof(addr)) == -1 || listen(fd, 8) == -1) {
+        HLOGE("halvenor-sim: cannot listen on %s: %s", path.c_str(), strerror(errno));
+        if (fd != -1) close(fd);
+        return -1;
+    }
+    *where = "unix:" + path;
+    return fd;
+}
+
+static int listen_tcp(int port, std::string* where) {
+    int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    int one = 1;
+    if (fd != -1) setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof(one));
+    struct sockaddr_in addr = {};
+    addr.sin_family = AF_INET;
+    addr.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    addr.sin_port = htons(static_cast<uint16_t>(port));
+    socklen_t len = sizeof(addr);
+    if (fd == -1 || bind(fd, reinterpret_cast<sockaddr*>(&addr), len) == -1 || listen(fd, 8) == -1 ||
+        getsockname(fd, reinterpret_cast<sockaddr*>(&addr), &len) == -1) {
+        HLOGE("halvenor-sim: cannot listen on 127.0.0.1:%d: %s", port, strerror(errno));
+        if (fd != -1) close(fd);
+        return -1;
+    }
+    *where = "tcp:127.0.0.1:" + std::to_string(ntohs(addr.sin_port));
+    return fd;
+}
+
+int sim_server_listen(const SimServerOptions& options, std::string* where) {
+    if (!options.unix_path.empty()) return listen_unix(options.unix_path, where);
+    return listen_tcp(options.tcp_port, where);
+}
+
+// One connection: commands in, the controller's events out, in order.
+static void serve_connection(int fd, SimAir* air, SimControllerSettings settings) {
+    SimController controller(*air, settings);
+    H4Stream stream;
+    uint8_t buf[4096];
+    bool writable = true;
+    auto sink = [&](const H4Packet& packet) {
+        if (packet.type != H4_COMMAND) return;  // no data in the test modes
+        for (const auto& event : controller.command(packet.bytes.data(), packet.bytes.size())) {
+            if (writable && !h4_send(fd, true, H4_EVENT, event.data(), event.size())) writable = false;
+        }
+    };
+    for (;;) {
+        ssize_t n = read(fd, buf, sizeof(buf));
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0 || !writable) break;
+        if (!stream.feed(buf, static_cast<size_t>(n), sink)) {
+            HLOGE("halvenor-sim: unknown packet type 0x%02x, connection closed", stream.badType());
+            break;
+        }
+    }
+    // The controller ends its tests as it goes, so a vanished tester stops transmitting.
+}
+
+struct Connection {
+    int fd;
+    std::atomic<bool> done{false};
+    std::thread thread;
+};
+
+// Gives back the descriptors and threads of connections that have ended.
+static void reap_connections(std::vector<std::unique_ptr<Connection>>& connections) {
+    for (auto it = connections.begin(); it != connections.end();) {
+        if (!(*it)->done.load()) {
+            ++it;
+            continue;
+        }
+        (*it)->thread.join();
+        close((*it)->fd);
+        it = connections.erase(it);
+    }
+}
+
+static void stop_connections(std::vector<std::unique_ptr<Connection>>& connections) {
+    for (auto& c : connections) shutdown(c->fd, SHUT_RDWR);
+    for (auto& c : connections) {
+        c->thread.join();
+        close(c->fd);
+    }
+    connections.clear();
+}
+
+void sim_server_run(int listen_fd, int stop_fd, const SimControllerSettings& settings) {
+    SimAir air;
+    std::vector<std::unique_ptr<Connection>> connections;
+    for (;;) {
+        struct pollfd pfds[2] = {{listen_fd, POLLIN, 0}, {stop_fd, POLLIN, 0}};
+        if (poll(pfds, 2, -1) == -1) {
+            if (errno == EINTR) continue;
+            HLOGE("halvenor-sim: poll: %s", strerror(errno));
+            break;
+        }
+        if (pfds[1].revents != 0) break;
+        int fd = accept4(listen_fd, nullptr, nullptr, SOCK_CLOEXEC);
+        if (fd == -1) continue;
+        int one = 1;
+        setsockopt(fd, IPPROTO_TCP, TCP_NODELAY, &one, sizeof(one));  // fails harmlessly on unix sockets
+        auto c = std::make_unique<Connection>();
+        c->fd = fd;
+        Connection* raw = c.get();
+        c->thread = std::thread([raw, &air, settings] {
+            serve_connection(raw->fd, &air, settings);
+            raw->done.store(true);
+        });
+        reap_connections(connections);
+        connections.push_back(std::move(c));
+    }
+    stop_connections(connections);
+}

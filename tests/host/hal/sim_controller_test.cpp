@@ -1,0 +1,156 @@
+// The simulated controller: command bytes in, event bytes out, on an air
+// whose clock the test moves; two controllers on one air.
+#include "host/hal/sim_controller.h"
+
+#include <algorithm>
+
+#include <gtest/gtest.h>
+
+#include "tests/host/host_test_support.h"
+
+namespace {
+
+struct Step {
+    int64_t advance_us;  // the air's clock moves this much before the command
+    Bytes command;       // HCI command without the H4 type byte
+    Bytes event;         // the one event expected back
+};
+
+struct Case {
+    const char* name;
+    std::vector<Step> steps;
+};
+
+class SimControllerTest : public ::testing::Test {
+  protected:
+    SimAir air{[this] { return now_us; }};
+    int64_t now_us = 1000000;
+
+    void run(SimController& c, const Case& tc) {
+        for (size_t i = 0; i < tc.steps.size(); ++i) {
+            const Step& s = tc.steps[i];
+            now_us += s.advance_us;
+            auto events = c.command(s.command.data(), s.command.size());
+            ASSERT_EQ(1u, events.size()) << tc.name << " step " << i;
+            EXPECT_EQ(s.event, events[0]) << tc.name << " step " << i;
+        }
+    }
+};
+
+// Command Complete: 0E, length, 1 command allowed, opcode, status, return parameters.
+Bytes complete(uint16_t op, uint8_t status, Bytes ret = {}) {
+    Bytes e(6 + ret.size());
+    e[0] = 0x0E;
+    e[1] = static_cast<uint8_t>(4 + ret.size());
+    e[2] = 0x01;
+    e[3] = static_cast<uint8_t>(op);
+    e[4] = static_cast<uint8_t>(op >> 8);
+    e[5] = status;
+    std::copy(ret.begin(), ret.end(), e.begin() + 6);
+    return e;
+}
+
+const Bytes kReset = {0x03, 0x0C, 0x00};
+const Bytes kTestEnd = {0x1F, 0x20, 0x00};
+const Bytes kRx19 = {0x1D, 0x20, 0x01, 0x13};
+const Bytes kRx19_2M = {0x33, 0x20, 0x03, 0x13, 0x02, 0x00};
+const Bytes kTx19 = {0x1E, 0x20, 0x03, 0x13, 0x25, 0x00};
+const Bytes kTx19_2M = {0x34, 0x20, 0x04, 0x13, 0x25, 0x00, 0x02};
+
+const Case kAnswers[] = {
+        {"Reset", {{0, kReset, complete(0x0C03, 0x00)}}},
+        {"EnableDeviceUnderTestMode", {{0, {0x03, 0x18, 0x00}, complete(0x1803, 0x00)}}},
+        {"SetEventFilterAutoAccept", {{0, {0x05, 0x0C, 0x03, 0x02, 0x00, 0x02}, complete(0x0C05, 0x00)}}},
+        {"SetEventFilterClear", {{0, {0x05, 0x0C, 0x01, 0x00}, complete(0x0C05, 0x00)}}},
+        {"SetEventFilterTruncated", {{0, {0x05, 0x0C, 0x02, 0x02, 0x00}, complete(0x0C05, 0x12)}}},
+        {"SetEventFilterEmpty", {{0, {0x05, 0x0C, 0x00}, complete(0x0C05, 0x12)}}},
+        {"WriteScanEnable", {{0, {0x1A, 0x0C, 0x01, 0x03}, complete(0x0C1A, 0x00)}}},
+        {"WriteScanEnableOutOfRange", {{0, {0x1A, 0x0C, 0x01, 0x04}, complete(0x0C1A, 0x12)}}},
+        {"WriteAuthenticationEnable", {{0, {0x20, 0x0C, 0x01, 0x00}, complete(0x0C20, 0x00)}}},
+        {"WriteEncryptionMode", {{0, {0x22, 0x0C, 0x01, 0x00}, complete(0x0C22, 0x00)}}},
+        {"ContinuousWave",
+         {{0, {0x04, 0xFC, 0x09, 0x05, 0x01, 0x09, 0x04, 0x20, 0x00, 0x00, 0x00, 0x00},
+           complete(0xFC04, 0x00)}}},
+        {"UnknownOpcode", {{0, {0x01, 0x10, 0x00}, complete(0x1001, 0x01)}}},
+        {"UnknownVendorOpcode", {{0, {0x05, 0xFC, 0x00}, complete(0xFC05, 0x01)}}},
+        {"WrongParameterLength", {{0, {0x1D, 0x20, 0x02, 0x13, 0x00}, complete(0x201D, 0x12)}}},
+        {"LengthByteDisagreesWithPacket", {{0, {0x1D, 0x20, 0x02, 0x13}, complete(0x201D, 0x12)}}},
+        {"ChannelOutOfRange", {{0, {0x1D, 0x20, 0x01, 0x28}, complete(0x201D, 0x12)}}},
+        {"ReceiverTestV2BadPhy", {{0, {0x33, 0x20, 0x03, 0x13, 0x04, 0x00}, complete(0x2033, 0x12)}}},
+        {"TestEndWithoutTest", {{0, kTestEnd, complete(0x201F, 0x00, {0x00, 0x00})}}},
+        {"TestEndAfterTransmitterReportsZero",
+         {{0, kTx19, complete(0x201E, 0x00)}, {1000000, kTestEnd, complete(0x201F, 0x00, {0x00, 0x00})}}},
+        {"TestWhileTestRunsIsDisallowed",
+         {{0, kRx19, complete(0x201D, 0x00)},
+          {0, kTx19_2M, complete(0x2034, 0x0C)},
+          {0, kRx19_2M, complete(0x2033, 0x0C)}}},
+        {"ResetEndsRunningTest",
+         {{0, kTx19, complete(0x201E, 0x00)}, {0, kReset, complete(0x0C03, 0x00)},
+          {0, kRx19, complete(0x201D, 0x00)}}},
+        // 100 ms of a 625 us reference transmitter: 160 packets (0x00A0).
+        {"ReceiverHearsReferenceTransmitter",
+         {{0, kRx19, complete(0x201D, 0x00)}, {100000, kTestEnd, complete(0x201F, 0x00, {0xA0, 0x00})}}},
+        {"ReceiverTestV2HearsReferenceOn2M",
+         {{0, kRx19_2M, complete(0x2033, 0x00)}, {62500, kTestEnd, complete(0x201F, 0x00, {0x64, 0x00})}}},
+};
+
+TEST_F(SimControllerTest, AnswersEachCommandAsTheCoreSpecificationPrescribes) {
+    for (const Case& tc : kAnswers) {
+        SimController c(air, {true, 0.0});
+        run(c, tc);
+    }
+}
+
+TEST_F(SimControllerTest, ReceiverCountsOnlyTransmitterOnSameChannelAndPhy) {
+    SimController tx(air, {}), rx(air, {});
+    const Case cases[] = {
+            {"same", {{0, kTx19, complete(0x201E, 0)}, {0, kRx19, complete(0x201D, 0)},
+                      {62500, kTestEnd, complete(0x201F, 0, {0x64, 0x00})}}},
+            {"other PHY", {{0, kTx19_2M, complete(0x2034, 0)}, {0, kRx19, complete(0x201D, 0)},
+                           {62500, kTestEnd, complete(0x201F, 0, {0x00, 0x00})}}},
+            {"other channel", {{0, {0x1E, 0x20, 0x03, 0x27, 0x25, 0x00}, complete(0x201E, 0)},
+                               {0, kRx19, complete(0x201D, 0)},
+                               {62500, kTestEnd, complete(0x201F, 0, {0x00, 0x00})}}},
+    };
+    for (const Case& tc : cases) {
+        // The transmitter's step runs on tx, the rest on rx.
+        run(tx, {tc.name, {tc.steps[0]}});
+        run(rx, {tc.name, {tc.steps[1], tc.steps[2]}});
+        tx.endTests();
+    }
+}
+
+TEST_F(SimControllerTest, ReceiverCountsOnlyWhileBothRun) {
+    SimController tx(air, {}), rx(air, {});
+    run(rx, {"rx", {{0, kRx19, complete(0x201D, 0)}}});
+    now_us += 50000;  // 80 packet slots before the transmitter starts
+    run(tx, {"tx", {{0, kTx19, complete(0x201E, 0)}, {62500, kTestEnd, complete(0x201F, 0, {0, 0})}}});
+    now_us += 50000;  // and 80 after it stopped
+    run(rx, {"rx", {{0, kTestEnd, complete(0x201F, 0, {0x64, 0x00})}}});
+}
+
+TEST_F(SimControllerTest, LossLowersCount) {
+    SimController c(air, {true, 0.25});
+    run(c, {"loss", {{0, kRx19, complete(0x201D, 0)}, {100000, kTestEnd, complete(0x201F, 0, {120, 0})}}});
+}
+
+TEST_F(SimControllerTest, CountWrapsAtSixteenBits) {
+    SimController c(air, {true, 0.0});
+    // 65536 + 100 packets of 625 us.
+    run(c, {"wrap",
+            {{0, kRx19, complete(0x201D, 0)},
+             {(65536 + 100) * 625LL, kTestEnd, complete(0x201F, 0, {100, 0})}}});
+}
+
+TEST_F(SimControllerTest, DisconnectedTransmitterStopsSending) {
+    SimController rx(air, {});
+    {
+        SimController tx(air, {});
+        run(tx, {"tx", {{0, kTx19, complete(0x201E, 0)}}});
+        run(rx, {"rx", {{0, kRx19, complete(0x201D, 0)}}});
+        now_us += 62500;
+    }
+    run(rx, {"rx", {{62500, kTestEnd, complete(0x201F, 0, {0x64, 0x00})}}});
+}
+
+}  // namespace
