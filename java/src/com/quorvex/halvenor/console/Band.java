@@ -1,0 +1,40 @@
+// The three LE test channels the library offers, named by centre frequency.
+package com.quorvex.halvenor.console;
+
+import com.quorvex.halvenor.TestModeUtils;
+
+enum Band {
+    F2402(2402, 0),
+    F2440(2440, 19),
+    F2480(2480, 39);
+
+    final int mhz;
+    final int channel;
+
+    Band(int mhz, int channel) {
+        this.mhz = mhz;
+        this.channel = channel;
+    }
+
+    int txCode() {
+        return TestModeUtils.TX_2402 - 2402 + mhz;
+    }
+
+    int rxCode() {
+        return TestModeUtils.RX_2402 - 2402 + mhz;
+    }
+
+    String label() {
+        return mhz + " MHz (ch " + channel + ")";
+    }
+
+    static Band parse(String text) throws UsageException {
+        String t = text.trim().toLowerCase().replace("mhz", "").trim();
+        for (Band b : values()) {
+            if (t.equals(Integer.toString(b.mhz))) {
+                return b;
+            }
+        }
+        throw new UsageException("bad --freq '" + text + "': valid values are 2402 (ch 0), 2440 (ch 19), 2480 (ch 39)");
+    }
+}
