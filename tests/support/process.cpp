@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <string>
 #include <thread>
 
 static std::vector<int> listDir(const char* path) {
@@ -24,11 +25,20 @@ int countThreads() {
     // Sanitizer runtimes start a helper thread at the first thread creation;
     // let that happen before anything is counted.
     static const bool warmed = [] {
-        std::thread([] {}).join();
+        pid_t tid = 0;
+        std::thread([&tid] { tid = gettid(); }).join();
+        // A joined thread can stay listed for a moment (long enough to be
+        // seen under qemu-user): count only once it has gone.
+        std::string task = "/proc/self/task/" + std::to_string(tid);
+        waitUntil([&task] { return access(task.c_str(), F_OK) != 0; });
         return true;
     }();
     (void)warmed;
     return static_cast<int>(listDir("/proc/self/task").size());
+}
+int settledThreadCount(int expected, int timeout_ms) {
+    waitUntil([expected] { return countThreads() == expected; }, timeout_ms);
+    return countThreads();
 }
 std::vector<int> threadIds() { return listDir("/proc/self/task"); }
 

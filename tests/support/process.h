@@ -8,6 +8,10 @@
 
 int countOpenFds();
 int countThreads();
+// countThreads() once it equals `expected`, or when timeout_ms has passed: a
+// joined thread can stay listed for a moment after pthread_join returns, long
+// enough to be seen under qemu-user.
+int settledThreadCount(int expected, int timeout_ms = 5000);
 std::vector<int> threadIds();
 // Reads exactly n bytes, waiting at most timeout_ms overall; returns what arrived.
 std::vector<uint8_t> readBytes(int fd, size_t n, int timeout_ms = 5000);
