@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # Builds and runs every test: the plain build (C++ and JVM suites), the C++
-# suites under AddressSanitizer + UndefinedBehaviorSanitizer, and the threaded
-# suites under ThreadSanitizer. Fails on any failing test or sanitizer report.
+# suites under AddressSanitizer + UndefinedBehaviorSanitizer, the threaded
+# suites under ThreadSanitizer, and the C++ suites cross-built for aarch64 under
+# qemu (scripts/test-aarch64.sh). Fails on any failing test or sanitizer report.
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
 bash "$root/scripts/install-deps.sh"
@@ -30,6 +31,12 @@ step "threaded suites under ThreadSanitizer"
 build tsan -DHALVENOR_SANITIZE=thread -DHALVENOR_JAVA=OFF
 TSAN_OPTIONS="halt_on_error=1 second_deadlock_stack=1 suppressions=$root/tests/tsan.supp" \
   ctest --test-dir "$root/build/tsan" --output-on-failure -j "$jobs" -L threaded
+
+step "fuzz targets, 30 s each (long campaign: bash scripts/fuzz.sh 3600)"
+bash "$root/scripts/fuzz.sh" 30
+
+step "aarch64 cross build and C++ suites under qemu-aarch64"
+bash "$root/scripts/test-aarch64.sh"
 
 echo
 echo "all test runs passed"

@@ -5,6 +5,7 @@
 #include <errno.h>
 #include <poll.h>
 #include <string.h>
+#include <sys/socket.h>
 
 #include <vector>
 
@@ -36,12 +37,30 @@ static WaitResult wait_for_tool_data(int fd) {
     return WAIT_READABLE;
 }
 
-// Reads one whole packet into `packet` (without the type byte); false ends the pump.
-static bool read_packet(int fd, uint8_t* type, std::vector<uint8_t>& packet) {
+// A busy tool end has the next packet waiting already: its type byte is
+// taken without a wait, which saves a poll call per packet under load. An
+// empty stream, its end or an error are left to the wait and safe_read,
+// which report them as ever; errno is kept for their messages.
+static bool take_waiting_type_byte(int fd, uint8_t* type) {
+    int saved_errno = errno;
+    ssize_t n;
+    while ((n = recv(fd, type, 1, MSG_DONTWAIT)) == -1 && errno == EINTR) {
+    }
+    if (n != 1) errno = saved_errno;
+    return n == 1;
+}
+
+static bool read_type_byte(int fd, uint8_t* type) {
     if (safe_read(fd, type, 1) == -1) {
         LOGE("%s: failed to read the packet from tools", "process_tool_data");
         return false;
     }
+    return true;
+}
+
+// Reads the rest of the packet whose type byte is in; `packet` receives it
+// without the type byte. False ends the pump.
+static bool read_packet(int fd, uint8_t* type, std::vector<uint8_t>& packet) {
     LOGI("%s: Packet type :%d", "process_tool_data", *type);
     if (*type == 0 || *type > H4_TYPE_EVENT) {
         LOGE("%s: Unsupported preamble_len packet type %d", "process_tool_data", *type);
@@ -99,14 +118,17 @@ void* process_tool_data(void*) {
     // after the pump has been joined.
     int fd = server_fd;
     for (;;) {
-        WaitResult waited = wait_for_tool_data(fd);
-        if (waited == WAIT_FAILED) break;
-        if (waited == WAIT_TIMED_OUT) {
-            if (__atomic_load_n(&client_fd, __ATOMIC_ACQUIRE) != -1) continue;
-            LOGI("Quit test mode!");
-            break;
-        }
         uint8_t type = 0;
+        if (!take_waiting_type_byte(fd, &type)) {
+            WaitResult waited = wait_for_tool_data(fd);
+            if (waited == WAIT_FAILED) break;
+            if (waited == WAIT_TIMED_OUT) {
+                if (__atomic_load_n(&client_fd, __ATOMIC_ACQUIRE) != -1) continue;
+                LOGI("Quit test mode!");
+                break;
+            }
+            if (!read_type_byte(fd, &type)) break;
+        }
         if (!read_packet(fd, &type, packet)) break;
         forward_packet(type, packet);
     }
