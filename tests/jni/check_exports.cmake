@@ -28,14 +28,8 @@ foreach(line ${lines})
   if(NOT line MATCHES "^[0-9a-fA-F]* *([A-Za-z]) (.+)$")
     continue()
   endif()
-  set(kind ${CMAKE_MATCH_1})
   set(name ${CMAKE_MATCH_2})
   if(name IN_LIST linker_defined)
-    continue()
-  endif()
-  # Template code that libstdc++'s headers instantiate with default
-  # visibility (weak, in namespace std) is not the library's own.
-  if(kind MATCHES "^[WwVv]$" AND name MATCHES "^_ZN?K?St")
     continue()
   endif()
   # AddressSanitizer's one-definition-rule indicators of exported data.
