@@ -8,31 +8,24 @@
 #include <hidl/HostServices.h>
 
 #include "host/hal/h4_hci.h"
+#include "host/hal/host_hci.h"
 #include "host/hal/host_log.h"
 #include "host/hal/sim_hci.h"
-
-using android::sp;
-using android::hardware::hidl_vec;
-using android::hardware::Return;
-using android::hardware::Void;
-using android::hardware::bluetooth::V1_0::IBluetoothHci;
-using android::hardware::bluetooth::V1_0::IBluetoothHciCallbacks;
-using android::hardware::bluetooth::V1_0::Status;
 
 namespace {
 
 // What getService hands out for a setting it cannot use: the library sees a
 // service whose initialisation fails, and logs that itself.
-class UnusableHci : public IBluetoothHci {
+class UnusableHci final : public HostHci {
   public:
     Return<void> initialize(const sp<IBluetoothHciCallbacks>& callback) override {
         callback->initializationComplete(Status::INITIALIZATION_ERROR);
         return Void();
     }
-    Return<void> sendHciCommand(const hidl_vec<uint8_t>&) override { return Void(); }
-    Return<void> sendAclData(const hidl_vec<uint8_t>&) override { return Void(); }
-    Return<void> sendScoData(const hidl_vec<uint8_t>&) override { return Void(); }
-    Return<void> close() override { return Void(); }
+
+  private:
+    Return<void> send(uint8_t, const hidl_vec<uint8_t>&) override { return Void(); }
+    void stop() override {}
 };
 
 std::string env_or(const char* name, const char* fallback) {

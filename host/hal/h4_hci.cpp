@@ -26,15 +26,8 @@
 #include "host/hal/btsnoop.h"
 #include "host/hal/h4_io.h"
 #include "host/hal/h4_stream.h"
+#include "host/hal/host_hci.h"
 #include "host/hal/host_log.h"
-
-using android::sp;
-using android::hardware::hidl_vec;
-using android::hardware::Return;
-using android::hardware::Void;
-using android::hardware::bluetooth::V1_0::IBluetoothHci;
-using android::hardware::bluetooth::V1_0::IBluetoothHciCallbacks;
-using android::hardware::bluetooth::V1_0::Status;
 
 // A controller that has not answered a connect by then is not coming.
 static const int kConnectTimeoutMs = 3000;
@@ -219,19 +212,12 @@ static int connect_target(const H4Target& t, int wake, std::string* why) {
 
 namespace {
 
-class H4Hci : public IBluetoothHci {
+class H4Hci final : public HostHci {
   public:
     explicit H4Hci(H4Target target) : target_(std::move(target)) {}
     ~H4Hci() override { stop(); }
 
     Return<void> initialize(const sp<IBluetoothHciCallbacks>& callback) override;
-    Return<void> sendHciCommand(const hidl_vec<uint8_t>& p) override { return send(H4_COMMAND, p); }
-    Return<void> sendAclData(const hidl_vec<uint8_t>& p) override { return send(H4_ACL, p); }
-    Return<void> sendScoData(const hidl_vec<uint8_t>& p) override { return send(H4_SCO, p); }
-    Return<void> close() override {
-        stop();
-        return Void();
-    }
 
   private:
     bool isSocket() const { return target_.kind != H4Target::TTY; }
@@ -239,8 +225,8 @@ class H4Hci : public IBluetoothHci {
     void readLoop(int fd);
     void deliver(const H4Packet& packet);
     void endSession(int fd);
-    Return<void> send(uint8_t type, const hidl_vec<uint8_t>& packet);
-    void stop();
+    Return<void> send(uint8_t type, const hidl_vec<uint8_t>& packet) override;
+    void stop() override;
 
     const H4Target target_;
     sp<IBluetoothHciCallbacks> callbacks_;  // set before the reader starts, cleared after it ends

@@ -11,16 +11,8 @@
 #include <vector>
 
 #include "host/hal/btsnoop.h"
-#include "host/hal/h4_stream.h"
+#include "host/hal/host_hci.h"
 #include "host/hal/host_log.h"
-
-using android::sp;
-using android::hardware::hidl_vec;
-using android::hardware::Return;
-using android::hardware::Void;
-using android::hardware::bluetooth::V1_0::IBluetoothHci;
-using android::hardware::bluetooth::V1_0::IBluetoothHciCallbacks;
-using android::hardware::bluetooth::V1_0::Status;
 
 namespace {
 
@@ -30,30 +22,23 @@ std::shared_ptr<SimAir> process_air() {
     return *air;
 }
 
-class SimHci : public IBluetoothHci {
+class SimHci final : public HostHci {
   public:
     explicit SimHci(SimControllerSettings settings)
         : air_(process_air()), controller_(*air_, settings) {}
     ~SimHci() override { stop(); }
 
     Return<void> initialize(const sp<IBluetoothHciCallbacks>& callback) override;
-    Return<void> sendHciCommand(const hidl_vec<uint8_t>& command) override;
-    Return<void> sendAclData(const hidl_vec<uint8_t>& data) override { return drop(H4_ACL, data); }
-    Return<void> sendScoData(const hidl_vec<uint8_t>& data) override { return drop(H4_SCO, data); }
-    Return<void> close() override {
-        stop();
-        return Void();
-    }
 
   private:
     struct Work {
         std::vector<uint8_t> command;
     };
-    Return<void> drop(uint8_t type, const hidl_vec<uint8_t>& data);
+    Return<void> send(uint8_t type, const hidl_vec<uint8_t>& packet) override;
     void eventLoop();
     bool nextWork(Work* work);
     void answer(const std::vector<uint8_t>& command);
-    void stop();
+    void stop() override;
 
     std::shared_ptr<SimAir> air_;  // outlives controller_, which runs tests on it
     SimController controller_;     // event thread only (and stop, after the join)
@@ -76,22 +61,18 @@ Return<void> SimHci::initialize(const sp<IBluetoothHciCallbacks>& callback) {
     return Void();
 }
 
-Return<void> SimHci::sendHciCommand(const hidl_vec<uint8_t>& command) {
+// Commands go to the event thread. ACL and SCO data are only captured: the
+// test modes carry none, and a controller in them would discard it too.
+Return<void> SimHci::send(uint8_t type, const hidl_vec<uint8_t>& packet) {
     std::lock_guard<std::mutex> guard(lock_);
-    if (!running_) {
+    if (type == H4_COMMAND && !running_) {
         HLOGE("sim: command sent outside a session, dropped");
         return Void();
     }
-    if (snoop_) snoop_->record(H4_COMMAND, command.data(), command.size(), false);
-    queue_.push_back({std::vector<uint8_t>(command.begin(), command.end())});
+    if (snoop_) snoop_->record(type, packet.data(), packet.size(), false);
+    if (type != H4_COMMAND) return Void();
+    queue_.push_back({std::vector<uint8_t>(packet.begin(), packet.end())});
     wake_.notify_one();
-    return Void();
-}
-
-// The test modes carry no data; a controller in them would discard it too.
-Return<void> SimHci::drop(uint8_t type, const hidl_vec<uint8_t>& data) {
-    std::lock_guard<std::mutex> guard(lock_);
-    if (snoop_) snoop_->record(type, data.data(), data.size(), false);
     return Void();
 }
 

@@ -3,6 +3,8 @@
 
 #include "tests/support/process.h"
 
+#include <gtest/gtest.h>
+
 #include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
@@ -73,16 +75,47 @@ sp<IBluetoothHci> serviceFor(const char* hci) {
     return IBluetoothHci::getService("default");
 }
 
-Child spawnChild(const std::vector<std::string>& argv) {
+StartedHci startHci(const char* hci) {
+    StartedHci started{serviceFor(hci), new RecordingCallbacks()};
+    EXPECT_NE(nullptr, started.hci.get()) << (hci != nullptr ? hci : "(unset)");
+    if (started.hci == nullptr) return started;
+    started.hci->initialize(started.callbacks);
+    HciStatus status = HciStatus::UNKNOWN;
+    EXPECT_TRUE(started.callbacks->waitForInit(&status));
+    EXPECT_EQ(HciStatus::SUCCESS, status);
+    return started;
+}
+
+Bytes commandEvent(const StartedHci& started, const Bytes& command) {
+    size_t before = started.callbacks->packets().size();
+    started.hci->sendHciCommand(command);
+    if (!started.callbacks->waitForPackets(before + 1)) return {};
+    return started.callbacks->packets()[before].bytes;
+}
+
+int64_t steadyUs() {
+    return std::chrono::duration_cast<std::chrono::microseconds>(
+                   std::chrono::steady_clock::now().time_since_epoch())
+            .count();
+}
+
+Child spawnChild(const std::vector<std::string>& argv, bool with_stdin) {
     int fds[2];
+    int in[2] = {-1, -1};
     Child child;
     if (pipe2(fds, O_CLOEXEC) == -1) return child;
+    if (with_stdin && pipe2(in, O_CLOEXEC) == -1) {
+        close(fds[0]);
+        close(fds[1]);
+        return child;
+    }
     pid_t parent = getpid();
     child.pid = fork();
     if (child.pid == 0) {
         prctl(PR_SET_PDEATHSIG, SIGKILL);
         if (getppid() != parent) _exit(127);
         dup2(fds[1], STDOUT_FILENO);
+        if (with_stdin) dup2(in[0], STDIN_FILENO);
         std::vector<char*> args;
         for (const auto& a : argv) args.push_back(const_cast<char*>(a.c_str()));
         args.push_back(nullptr);
@@ -91,6 +124,10 @@ Child spawnChild(const std::vector<std::string>& argv) {
     }
     close(fds[1]);
     child.out = fds[0];
+    if (with_stdin) {
+        close(in[0]);
+        child.in = in[1];
+    }
     return child;
 }
 
@@ -109,6 +146,7 @@ void stopChild(Child& child) {
         }
     }
     if (child.out != -1) close(child.out);
+    if (child.in != -1) close(child.in);
     child = Child();
 }
 

@@ -53,12 +53,27 @@ class RecordingCallbacks : public android::hardware::bluetooth::V1_0::IBluetooth
 // Sets HALVENOR_HCI (unset for nullptr) and asks the registry for "default".
 android::sp<android::hardware::bluetooth::V1_0::IBluetoothHci> serviceFor(const char* hci);
 
+// A service from serviceFor, initialised, with the callbacks it reports to.
+struct StartedHci {
+    android::sp<android::hardware::bluetooth::V1_0::IBluetoothHci> hci;
+    android::sp<RecordingCallbacks> callbacks;
+};
+// serviceFor(hci), initialised; a missing or failed initialisation fails the test.
+StartedHci startHci(const char* hci);
+// Sends a command and returns the packet that answers it, empty on time-out.
+Bytes commandEvent(const StartedHci& started, const Bytes& command);
+
+// The monotonic clock in microseconds, the same in every process.
+int64_t steadyUs();
+
 struct Child {
     pid_t pid = -1;
     int out = -1;  // the child's stdout, when captured
+    int in = -1;   // the child's stdin, when asked for
 };
-// Starts argv[0] with its stdout on a pipe; the child gets SIGKILL if the test dies.
-Child spawnChild(const std::vector<std::string>& argv);
+// Starts argv[0] with its stdout on a pipe (and its stdin on another when
+// with_stdin); the child gets SIGKILL if the test dies.
+Child spawnChild(const std::vector<std::string>& argv, bool with_stdin = false);
 // SIGTERM, then SIGKILL if it has not ended within a second; reaps it.
 void stopChild(Child& child);
 // One line of the child's stdout, waiting at most timeout_ms.

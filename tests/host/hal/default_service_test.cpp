@@ -20,12 +20,6 @@ using android::hardware::bluetooth::V1_0::IBluetoothHci;
 
 namespace {
 
-int64_t steadyUs() {
-    return std::chrono::duration_cast<std::chrono::microseconds>(
-                   std::chrono::steady_clock::now().time_since_epoch())
-            .count();
-}
-
 class DefaultServiceTest : public ::testing::Test {
   protected:
     void TearDown() override {

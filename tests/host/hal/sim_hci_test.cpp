@@ -15,7 +15,6 @@
 
 using android::sp;
 using android::hardware::hidl_vec;
-using android::hardware::bluetooth::V1_0::IBluetoothHci;
 
 namespace {
 
@@ -23,7 +22,7 @@ class SimHciTest : public ::testing::Test {
   protected:
     void SetUp() override { threads_before = countThreads(); }
     void TearDown() override {
-        for (auto& s : services) s->close();
+        for (auto& s : services) s.hci->close();
         services.clear();
         unsetenv("HALVENOR_SIM_REFTX");
         unsetenv("HALVENOR_SIM_LOSS");
@@ -31,24 +30,11 @@ class SimHciTest : public ::testing::Test {
     }
     // A started default service (HALVENOR_HCI unset) and its callbacks.
     sp<RecordingCallbacks> start() {
-        sp<IBluetoothHci> hci = serviceFor(nullptr);
-        EXPECT_NE(nullptr, hci.get());
-        sp<RecordingCallbacks> cb = new RecordingCallbacks();
-        hci->initialize(cb);
-        HciStatus status = HciStatus::UNKNOWN;
-        EXPECT_TRUE(cb->waitForInit(&status));
-        EXPECT_EQ(HciStatus::SUCCESS, status);
-        services.push_back(hci);
-        callbacks.push_back(cb);
-        return cb;
+        services.push_back(startHci(nullptr));
+        return services.back().callbacks;
     }
     // Sends a command on service i and returns the event it got back.
-    Bytes command(size_t i, const Bytes& cmd) {
-        size_t before = callbacks[i]->packets().size();
-        services[i]->sendHciCommand(cmd);
-        if (!callbacks[i]->waitForPackets(before + 1)) return {};
-        return callbacks[i]->packets()[before].bytes;
-    }
+    Bytes command(size_t i, const Bytes& cmd) { return commandEvent(services[i], cmd); }
     int rxCountOver(size_t i, int ms) {
         command(i, {0x1D, 0x20, 0x01, 0x13});
         std::this_thread::sleep_for(std::chrono::milliseconds(ms));  // time on the air, not a sync
@@ -56,8 +42,7 @@ class SimHciTest : public ::testing::Test {
         return end.size() == 8 ? end[6] | (end[7] << 8) : -1;
     }
 
-    std::vector<sp<IBluetoothHci>> services;
-    std::vector<sp<RecordingCallbacks>> callbacks;
+    std::vector<StartedHci> services;
     int threads_before = 0;
 };
 
@@ -71,7 +56,7 @@ TEST_F(SimHciTest, CallbacksRunOnServiceThreadNotCaller) {
 TEST_F(SimHciTest, AnswersCommandsInOrder) {
     sp<RecordingCallbacks> cb = start();
     for (int i = 0; i < 50; ++i) {
-        services[0]->sendHciCommand(hidl_vec<uint8_t>({static_cast<uint8_t>(i), 0x10, 0x00}));
+        services[0].hci->sendHciCommand(hidl_vec<uint8_t>({static_cast<uint8_t>(i), 0x10, 0x00}));
     }
     ASSERT_TRUE(cb->waitForPackets(50));
     auto packets = cb->packets();
@@ -103,7 +88,7 @@ TEST_F(SimHciTest, CloseEndsRunningTransmitter) {
     start();
     start();
     command(0, {0x1E, 0x20, 0x03, 0x13, 0x25, 0x00});
-    services[0]->close();
+    services[0].hci->close();
     EXPECT_EQ(0, rxCountOver(1, 50));
 }
 

@@ -13,23 +13,14 @@
 #include "tests/support/process.h"
 #include "transport/session.h"
 
-using android::sp;
-using android::hardware::bluetooth::V1_0::IBluetoothHci;
-
 namespace {
-
-int64_t steadyUs() {
-    return std::chrono::duration_cast<std::chrono::microseconds>(
-                   std::chrono::steady_clock::now().time_since_epoch())
-            .count();
-}
 
 class SimServerTest : public ::testing::Test {
   protected:
     void TearDown() override {
         hidl_client_close_tool_end();
         hidl_client_close();
-        for (auto& s : services) s->close();
+        for (auto& s : services) s.hci->close();
         services.clear();
         stopChild(server);
         unsetenv("HALVENOR_HCI");
@@ -46,26 +37,13 @@ class SimServerTest : public ::testing::Test {
     }
     // A started H4 service on the server and its callbacks.
     size_t connect(const std::string& where) {
-        sp<IBluetoothHci> hci = serviceFor(where.c_str());
-        sp<RecordingCallbacks> cb = new RecordingCallbacks();
-        hci->initialize(cb);
-        HciStatus status = HciStatus::UNKNOWN;
-        EXPECT_TRUE(cb->waitForInit(&status));
-        EXPECT_EQ(HciStatus::SUCCESS, status);
-        services.push_back(hci);
-        callbacks.push_back(cb);
+        services.push_back(startHci(where.c_str()));
         return services.size() - 1;
     }
-    Bytes command(size_t i, const Bytes& cmd) {
-        size_t before = callbacks[i]->packets().size();
-        services[i]->sendHciCommand(cmd);
-        if (!callbacks[i]->waitForPackets(before + 1)) return {};
-        return callbacks[i]->packets()[before].bytes;
-    }
+    Bytes command(size_t i, const Bytes& cmd) { return commandEvent(services[i], cmd); }
 
     Child server;
-    std::vector<sp<IBluetoothHci>> services;
-    std::vector<sp<RecordingCallbacks>> callbacks;
+    std::vector<StartedHci> services;
 };
 
 TEST_F(SimServerTest, TransmitterOnOneConnectionIsCountedOnAnother) {
