@@ -8,9 +8,11 @@
 
 int countOpenFds();
 int countThreads();
-// countThreads() once it equals `expected`, or when timeout_ms has passed: a
-// joined thread can stay listed for a moment after pthread_join returns, long
-// enough to be seen under qemu-user.
+// countThreads() once it is no more than `expected`, or when timeout_ms has
+// passed: a joined thread can stay listed for a moment after pthread_join
+// returns, long enough to be seen under qemu-user. For the same reason a
+// baseline may include a thread about to vanish, so leak checks compare with
+// EXPECT_LE rather than for equality.
 int settledThreadCount(int expected, int timeout_ms = 5000);
 std::vector<int> threadIds();
 // Reads exactly n bytes, waiting at most timeout_ms overall; returns what arrived.

@@ -141,7 +141,7 @@ class H4HciTest : public ::testing::TestWithParam<FarEndFactory> {
         callbacks.clear();
         far.reset();
         unsetenv("HALVENOR_HCI");
-        EXPECT_EQ(threads_before, settledThreadCount(threads_before)) << "reader thread joined";
+        EXPECT_LE(settledThreadCount(threads_before), threads_before) << "reader thread joined";
     }
     // Connects the backend to the far end and waits for its success.
     void connect() {
@@ -266,7 +266,7 @@ TEST_P(H4HciTest, CloseDisconnectsFarEnd) {
     connect();
     hci->close();
     EXPECT_TRUE(far->sawDisconnect());
-    EXPECT_EQ(threads_before, settledThreadCount(threads_before));
+    EXPECT_LE(settledThreadCount(threads_before), threads_before);
 }
 
 TEST_P(H4HciTest, UnreachableTargetFailsInitialisation) {
