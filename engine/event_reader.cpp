@@ -5,6 +5,7 @@
 
 #include <errno.h>
 #include <poll.h>
+#include <sys/socket.h>
 #include <time.h>
 #include <unistd.h>
 
@@ -34,21 +35,38 @@ static long now_ms() {
     return ts.tv_sec * 1000L + ts.tv_nsec / 1000000L;
 }
 
-// A controller that never answers must not hold the Java thread: each read is
-// preceded by a wait of at most HCI_REPLY_TIMEOUT_MS. A closed or invalid
-// descriptor is left to read() to report.
-static ssize_t timed_read(int fd, uint8_t* dst, size_t len, const char* what) {
-    long deadline = now_ms() + HCI_REPLY_TIMEOUT_MS;
+// Waits at most until deadline for fd to become readable; false (logged) when
+// it does not. A negative descriptor is left to the read to report.
+static bool wait_readable(int fd, long deadline, const char* what) {
     for (;;) {
         long left = deadline - now_ms();
         struct pollfd pfd = {fd, POLLIN, 0};
         int rc = fd < 0 ? 1 : poll(&pfd, 1, left > 0 ? static_cast<int>(left) : 0);
         if (rc == -1 && errno == EINTR) continue;
-        if (rc == 0) {
-            LOGE("%s: timed out after %d ms waiting for the %s, return %d", "read_incoming_events",
-                 HCI_REPLY_TIMEOUT_MS, what, -1);
-            return kTimedOut;
+        if (rc != 0) return true;
+        LOGE("%s: timed out after %d ms waiting for the %s, return %d", "read_incoming_events",
+             HCI_REPLY_TIMEOUT_MS, what, -1);
+        return false;
+    }
+}
+
+// A controller that never answers must not hold the Java thread: no read waits
+// longer than HCI_REPLY_TIMEOUT_MS. The rest of an event arrives with its type
+// byte, so on a socket it is taken at once and the wait is paid only when it
+// is not there; a type byte is rarely there yet (the controller has just been
+// asked), so it is waited for first, as on any other descriptor. A closed or
+// invalid descriptor is left to the read to report.
+static ssize_t timed_read(int fd, uint8_t* dst, size_t len, const char* what, bool wait_first) {
+    long deadline = now_ms() + HCI_REPLY_TIMEOUT_MS;
+    bool try_first = !wait_first;
+    for (;;) {
+        if (try_first) {
+            ssize_t n = recv(fd, dst, len, MSG_DONTWAIT);
+            if (n == -1 && errno == EINTR) continue;
+            if (n == -1 && errno == ENOTSOCK) try_first = false;
+            else if (n != -1 || (errno != EAGAIN && errno != EWOULDBLOCK)) return n;
         }
+        if (!wait_readable(fd, deadline, what)) return kTimedOut;
         ssize_t n = read(fd, dst, len);
         if (n == -1 && errno == EINTR) continue;
         return n;
@@ -59,7 +77,7 @@ static ssize_t timed_read(int fd, uint8_t* dst, size_t len, const char* what) {
 static ssize_t read_full(int fd, uint8_t* dst, int len, const char* what) {
     int done = 0;
     while (done < len) {
-        ssize_t n = timed_read(fd, dst + done, len - done, what);
+        ssize_t n = timed_read(fd, dst + done, len - done, what, false);
         if (n < 1) return n;
         done += static_cast<int>(n);
     }
@@ -166,7 +184,7 @@ static int read_events(int fd, uint8_t* buf, int opcode) {
         return -1;
     }
     for (;;) {
-        if (timed_read(fd, buf, 1, "packet type") < 1) return -1;
+        if (timed_read(fd, buf, 1, "packet type", true) < 1) return -1;
         if (buf[0] != H4_TYPE_EVENT) return -1;
         if (read_event_body(fd, buf) == -1) return -1;
         int len = buf[1];

@@ -7,6 +7,7 @@
 #include <poll.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
 #include "engine/event_reader.h"
@@ -33,6 +34,14 @@ static int build_packet(uint8_t* work, uint16_t ogf, uint16_t ocf, uint8_t plen,
     return 4 + plen;
 }
 
+// A descriptor that is not a socket has no non-blocking read of its own:
+// asked first whether anything waits, so the read cannot block.
+static ssize_t read_if_waiting(int fd, uint8_t* dst, size_t len) {
+    struct pollfd pfd = {fd, POLLIN, 0};
+    if (poll(&pfd, 1, 0) != 1 || !(pfd.revents & POLLIN)) return 0;
+    return read(fd, dst, len);
+}
+
 // Whatever is already waiting on fd arrived before this command was sent, so
 // it cannot answer it: a reply that came after its command timed out, or an
 // event nobody asked for. Dropped so the reader never takes it as the reply.
@@ -40,9 +49,9 @@ static void drop_stale_input(int fd) {
     uint8_t scratch[WORK_BUF_SIZE];
     int dropped = 0;
     while (dropped < MAX_STALE_BYTES) {
-        struct pollfd pfd = {fd, POLLIN, 0};
-        if (poll(&pfd, 1, 0) != 1 || !(pfd.revents & POLLIN)) break;
-        ssize_t n = read(fd, scratch, sizeof(scratch));
+        ssize_t n = recv(fd, scratch, sizeof(scratch), MSG_DONTWAIT);
+        if (n == -1 && errno == EINTR) continue;
+        if (n == -1 && errno == ENOTSOCK) n = read_if_waiting(fd, scratch, sizeof(scratch));
         if (n <= 0) break;
         dropped += static_cast<int>(n);
     }

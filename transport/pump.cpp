@@ -6,6 +6,7 @@
 #include <poll.h>
 #include <string.h>
 #include <sys/socket.h>
+#include <unistd.h>
 
 #include <vector>
 
@@ -37,17 +38,55 @@ static WaitResult wait_for_tool_data(int fd) {
     return WAIT_READABLE;
 }
 
-// A busy tool end has the next packet waiting already: its type byte is
-// taken without a wait, which saves a poll call per packet under load. An
-// empty stream, its end or an error are left to the wait and safe_read,
-// which report them as ever; errno is kept for their messages.
-static bool take_waiting_type_byte(int fd, uint8_t* type) {
+// Room for the largest packet (type byte, ACL preamble, 65535 data bytes) and
+// for many small ones at a time.
+static const size_t kBatchBytes = 65536 + 16;
+
+// Copies what is waiting on the stream into batch without taking it, so that
+// nothing is consumed before it is known to be a whole, valid packet. Bytes
+// copied, or 0 or -1 as recv() gives them; errno is kept for the messages of
+// the wait and safe_read that then take over.
+static ssize_t peek_waiting(int fd, std::vector<uint8_t>& batch) {
     int saved_errno = errno;
     ssize_t n;
-    while ((n = recv(fd, type, 1, MSG_DONTWAIT)) == -1 && errno == EINTR) {
+    while ((n = recv(fd, batch.data(), batch.size(), MSG_PEEK | MSG_DONTWAIT)) == -1 &&
+           errno == EINTR) {
     }
-    if (n != 1) errno = saved_errno;
-    return n == 1;
+    if (n <= 0) errno = saved_errno;
+    return n;
+}
+
+// Length on the wire, type byte included, of the packet at p, or 0 when its
+// type byte is not one the pump reads or the avail bytes end inside it.
+static size_t whole_packet_len(const uint8_t* p, size_t avail) {
+    if (avail < 1 || p[0] == 0 || p[0] > H4_TYPE_EVENT) return 0;
+    size_t preamble_len = static_cast<size_t>(preamble_len_table[p[0] - 1]);
+    if (avail < 1 + preamble_len) return 0;
+    size_t len = 1 + preamble_len + static_cast<size_t>(get_payload_len(p[0], p + 1));
+    return len <= avail ? len : 0;
+}
+
+// Bytes taken by the whole packets at the head of the peeked bytes.
+static size_t whole_packets_len(const uint8_t* p, size_t avail) {
+    size_t whole = 0;
+    for (size_t len; (len = whole_packet_len(p + whole, avail - whole)) > 0;) whole += len;
+    return whole;
+}
+
+// Takes the len bytes already peeked into batch, with one read as a rule:
+// the pump is the stream's only reader, so they are all there.
+static size_t take_peeked(int fd, std::vector<uint8_t>& batch, size_t len) {
+    size_t done = 0;
+    while (done < len) {
+        ssize_t n = read(fd, batch.data() + done, len - done);
+        if (n == -1 && errno == EINTR) continue;
+        if (n <= 0) {
+            LOGE("%s: failed to read the packet from tool", "process_tool_data");
+            break;
+        }
+        done += static_cast<size_t>(n);
+    }
+    return done;
 }
 
 static bool read_type_byte(int fd, uint8_t* type) {
@@ -88,7 +127,7 @@ static bool read_packet(int fd, uint8_t* type, std::vector<uint8_t>& packet) {
     return true;
 }
 
-static void forward_packet(uint8_t type, std::vector<uint8_t>& packet) {
+static void forward_packet(uint8_t type, uint8_t* packet, size_t len) {
     LOGE("PACKET_TYPE = %d", type);
     if (type == H4_TYPE_EVENT) {
         LOGE("%s: Unsupported packet type: %d", "process_tool_data", type);
@@ -101,15 +140,30 @@ static void forward_packet(uint8_t type, std::vector<uint8_t>& packet) {
         return;
     }
     hidl_vec<uint8_t> hci;
-    hci.setToExternal(packet.data(), packet.size());
+    hci.setToExternal(packet, len);
     Return<void> sent = type == H4_TYPE_COMMAND ? btHci->sendHciCommand(hci)
                         : type == H4_TYPE_ACL   ? btHci->sendAclData(hci)
                                                 : btHci->sendScoData(hci);
     if (!sent.isOk()) LOGE("%s: the HAL refused packet type %d", "process_tool_data", type);
 }
 
+// The packets taken at once are logged as one by one: the lines safe_read and
+// read_packet would give for each, in the same order.
+static void forward_batch(uint8_t* bytes, size_t len) {
+    for (size_t at = 0; at < len;) {
+        uint8_t type = bytes[at];
+        size_t packet_len = whole_packet_len(bytes + at, len - at);
+        if (packet_len == 0) return;
+        LOGI("%s: Packet type :%d", "process_tool_data", type);
+        if (packet_len == 1u + preamble_len_table[type - 1]) LOGE("%s: No data to read", "safe_read");
+        forward_packet(type, bytes + at + 1, packet_len - 1);
+        at += packet_len;
+    }
+}
+
 void* process_tool_data(void*) {
     std::vector<uint8_t> packet;
+    std::vector<uint8_t> batch(kBatchBytes);
     timeout.tv_sec = 0;
     timeout.tv_usec = 500000;
     LOGE("process_tool_data IN!");
@@ -117,20 +171,37 @@ void* process_tool_data(void*) {
     // The bridge end does not change while this pump runs: it is closed only
     // after the pump has been joined.
     int fd = server_fd;
+    // Set once a wait has found the stream readable though nothing could be
+    // peeked: its end or an error, which safe_read then reports.
+    bool readable = false;
     for (;;) {
-        uint8_t type = 0;
-        if (!take_waiting_type_byte(fd, &type)) {
+        // A busy tool end has many packets waiting: the whole ones are taken
+        // with one read. A bad type byte or a packet not yet whole is left to
+        // the reads of one packet at a time, which take nothing past it.
+        ssize_t peeked = peek_waiting(fd, batch);
+        size_t whole = peeked > 0 ? whole_packets_len(batch.data(), peeked) : 0;
+        if (whole > 0) {
+            size_t taken = take_peeked(fd, batch, whole);
+            forward_batch(batch.data(), taken);
+            if (taken < whole) break;
+            readable = false;
+            continue;
+        }
+        if (peeked <= 0 && !readable) {
             WaitResult waited = wait_for_tool_data(fd);
             if (waited == WAIT_FAILED) break;
-            if (waited == WAIT_TIMED_OUT) {
-                if (__atomic_load_n(&client_fd, __ATOMIC_ACQUIRE) != -1) continue;
+            if (waited == WAIT_READABLE) readable = true;
+            else if (__atomic_load_n(&client_fd, __ATOMIC_ACQUIRE) == -1) {
                 LOGI("Quit test mode!");
                 break;
             }
-            if (!read_type_byte(fd, &type)) break;
+            continue;
         }
+        readable = false;
+        uint8_t type = 0;
+        if (!read_type_byte(fd, &type)) break;
         if (!read_packet(fd, &type, packet)) break;
-        forward_packet(type, packet);
+        forward_packet(type, packet.data(), packet.size());
     }
     LOGE("Process tool OUT !!!");
     return nullptr;
