@@ -93,9 +93,10 @@ static void dump_event(const uint8_t* buf, int len) {
     LOGI("\n");
 }
 
-// A Command Complete or Command Status names the command it answers (Core
-// Specification Vol 4, Part E, 7.7.14 and 7.7.15). One for another command is
-// a late answer to an exchange that timed out, and must not end this one.
+// A Command Complete or Command Status names the command it answers
+// (Bluetooth Core Specification Vol 4, Part E, 7.7.14 and 7.7.15). One for
+// another command is a late answer to an exchange that timed out, and must
+// not end this one.
 static bool is_late_reply(const uint8_t* buf, int len, int opcode) {
     if (opcode == kAnyOpcode) return false;
     int answered = -1;
