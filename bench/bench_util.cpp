@@ -71,6 +71,16 @@ bool writeAll(int fd, const uint8_t* bytes, size_t len) {
     return true;
 }
 
+bool readExactly(int fd, uint8_t* buf, size_t len) {
+    size_t done = 0;
+    while (done < len) {
+        ssize_t n = read(fd, buf + done, len - done);
+        if (n <= 0) return false;
+        done += static_cast<size_t>(n);
+    }
+    return true;
+}
+
 std::vector<int> threadIds() {
     std::vector<int> ids;
     DIR* dir = opendir("/proc/self/task");

@@ -32,6 +32,8 @@ std::string withLog(const std::string& series, bool on);
 
 // Writes all len bytes; false on failure.
 bool writeAll(int fd, const uint8_t* bytes, size_t len);
+// Reads exactly len bytes with plain blocking reads; false on failure or end of stream.
+bool readExactly(int fd, uint8_t* buf, size_t len);
 
 // Threads of this process, sorted; and the one thread in `after` that is not
 // in `before` (-1 unless exactly one).

@@ -81,16 +81,6 @@ bool waitReadable(int fd, int ms) {
     return poll(&pfd, 1, ms) == 1;
 }
 
-bool readExactly(int fd, uint8_t* buf, size_t len) {
-    size_t done = 0;
-    while (done < len) {
-        ssize_t n = read(fd, buf + done, len - done);
-        if (n <= 0) return false;
-        done += static_cast<size_t>(n);
-    }
-    return true;
-}
-
 bool exchangeLikeEngine(int fd) {
     uint8_t reply[260];
     waitReadable(fd, 0);

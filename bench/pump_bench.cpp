@@ -45,20 +45,9 @@ void drainCounting(int fd, Tally* bytes, std::atomic<int>* tid) {
     }
 }
 
-// Packets per second, and the receiving thread's CPU time per packet: the
-// second is what the receiver itself costs, whatever else runs on the machine.
-// The pump's calls per packet without the library: a look for a waiting type
-// byte (a wait only when there is none), the preamble read, the payload read.
-bool readExactly(int fd, uint8_t* buf, size_t len) {
-    size_t done = 0;
-    while (done < len) {
-        ssize_t n = read(fd, buf + done, len - done);
-        if (n <= 0) return false;
-        done += static_cast<size_t>(n);
-    }
-    return true;
-}
-
+// The calls the pump made per packet before it took waiting packets in one
+// read, without the library: a look for a waiting type byte (a wait only when
+// there is none), the preamble read, the payload read.
 void readLikePump(int fd, Tally* packets, std::atomic<int>* tid) {
     tid->store(currentThreadId());
     std::vector<uint8_t> payload(65536);

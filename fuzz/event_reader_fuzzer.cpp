@@ -12,12 +12,15 @@
 
 #include "engine/event_reader.h"
 #include "fuzz/fuzz_check.h"
-#include "fuzz/fuzz_log.h"
+#include "tests/support/log_capture.h"
 #include "transport/session.h"
 
 using Bytes = std::vector<uint8_t>;
 
 namespace {
+
+// Keeps the library's many lines off stderr and lets the checks look them up.
+LogCapture g_log;
 
 // Whatever fits the socket buffer at once: the reader runs after the write.
 const size_t kMaxStream = 32768;
@@ -86,7 +89,7 @@ Bytes drain(int fd) {
 
 int count_upcalls() {
     int n = 0;
-    for (const auto& line : fuzz_log_lines()) n += line.rfind("onReceivedTestData() value: ", 0) == 0;
+    for (const auto& line : g_log.lines()) n += line.text.rfind("onReceivedTestData() value: ", 0) == 0;
     return n;
 }
 
@@ -107,7 +110,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     }
     shutdown(fds[1], SHUT_WR);
 
-    fuzz_log_reset();
+    g_log.clear();
     cmd_test_end_flag = test_end_pending ? 1 : 0;
     uint8_t buf[260] = {0};
     int rc = opcode >= 0 ? read_command_reply(fds[0], buf, static_cast<uint16_t>(opcode))
@@ -119,10 +122,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     FUZZ_CHECK(unread == tail, "%zu bytes unread, %zu expected", unread.size(), tail.size());
     FUZZ_CHECK(count_upcalls() == (want.upcall ? 1 : 0), "%d up-calls", count_upcalls());
     if (want.upcall) {
-        FUZZ_CHECK(fuzz_log_seen("onReceivedTestData() value: " + std::to_string(want.value)),
+        FUZZ_CHECK(g_log.contains(ANDROID_LOG_INFO, "onReceivedTestData() value: " + std::to_string(want.value)),
                    "up-call value is not %d", want.value);
     }
-    FUZZ_CHECK(want.zero_len == fuzz_log_seen("Zero len , invalid \n"), "zero-length line");
+    FUZZ_CHECK(want.zero_len == g_log.contains(ANDROID_LOG_INFO, "Zero len , invalid \n"), "zero-length line");
     // No Java is bound here, so nothing may consume the pending test end.
     FUZZ_CHECK(cmd_test_end_flag == (test_end_pending ? 1 : 0), "test-end flag changed");
 

@@ -6,47 +6,12 @@
 #include <vector>
 
 #include "fuzz/fuzz_check.h"
+#include "fuzz/h4_reference.h"
 #include "host/hal/h4_stream.h"
 
 using Bytes = std::vector<uint8_t>;
 
 namespace {
-
-struct Expected {
-    std::vector<H4Packet> packets;
-    bool bad_type = false;
-    uint8_t bad = 0;
-    size_t partial = 0;  // bytes of the packet left unfinished at the end
-};
-
-// Reference reading of an H4 stream (Core Specification Vol 4, Part A):
-// header lengths 3, 4, 3, 2 for types 1..4; payload length from header byte 2
-// (command, SCO), bytes 2-3 low first (ACL), byte 1 (event).
-Expected reference_parse(const Bytes& s) {
-    Expected e;
-    size_t at = 0;
-    while (at < s.size()) {
-        uint8_t type = s[at];
-        size_t header = type == 1 ? 3 : type == 2 ? 4 : type == 3 ? 3 : type == 4 ? 2 : 0;
-        if (header == 0) {
-            e.bad_type = true;
-            e.bad = type;
-            return e;
-        }
-        size_t h = at + 1;
-        size_t total = header;
-        if (h + header <= s.size()) {
-            total += type == 2 ? s[h + 2] + 256u * s[h + 3] : type == 4 ? s[h + 1] : s[h + 2];
-        }
-        if (h + header > s.size() || h + total > s.size()) {
-            e.partial = s.size() - at;
-            return e;
-        }
-        e.packets.push_back({type, Bytes(s.begin() + h, s.begin() + h + total)});
-        at = h + total;
-    }
-    return e;
-}
 
 struct Outcome {
     std::vector<H4Packet> packets;
@@ -80,9 +45,11 @@ Outcome feed(const Bytes& s, uint8_t seed) {
     return out;
 }
 
-void check(const Outcome& got, const Expected& want, const char* how) {
+void check(const Outcome& got, const ReferenceReading& want, const std::vector<uint8_t>& s, const char* how) {
     FUZZ_CHECK(got.ok == !want.bad_type, "%s: feed result", how);
-    if (!got.ok) FUZZ_CHECK(got.bad == want.bad, "%s: bad type %d, expected %d", how, got.bad, want.bad);
+    if (!got.ok) {
+        FUZZ_CHECK(got.bad == s[want.bad_at], "%s: bad type %d, expected %d", how, got.bad, s[want.bad_at]);
+    }
     FUZZ_CHECK(got.packets.size() == want.packets.size(), "%s: %zu packets, %zu expected", how,
                got.packets.size(), want.packets.size());
     for (size_t i = 0; i < got.packets.size(); ++i) {
@@ -98,8 +65,8 @@ void check(const Outcome& got, const Expected& want, const char* how) {
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     if (size < 1) return 0;
     Bytes s(data + 1, data + size);
-    Expected want = reference_parse(s);
-    check(feed(s, 0), want, "whole");
-    check(feed(s, data[0] == 0 ? 1 : data[0]), want, "pieces");
+    ReferenceReading want = read_h4_reference(s);
+    check(feed(s, 0), want, s, "whole");
+    check(feed(s, data[0] == 0 ? 1 : data[0]), want, s, "pieces");
     return 0;
 }

@@ -12,7 +12,8 @@
 #include <vector>
 
 #include "fuzz/fuzz_check.h"
-#include "fuzz/fuzz_log.h"
+#include "fuzz/h4_reference.h"
+#include "tests/support/log_capture.h"
 #include "tests/support/fake_hal.h"
 #include "transport/session.h"
 
@@ -20,41 +21,31 @@ using Bytes = std::vector<uint8_t>;
 
 namespace {
 
+// Keeps the library's many lines off stderr and lets the checks look them up.
+LogCapture g_log;
+
 // Bytes that may follow an unsupported type byte: few enough to fit the
 // socket buffer whether or not the pump still reads.
 const size_t kTailAfterStop = 64;
 // Generous: on a loaded machine a sanitized pump can lag far behind the writer.
 const int kBoundMs = 20000;
 
+// What the pump must do with a stream: forward its whole packets of types 1
+// to 3 and consume everything up to and including a bad type byte.
 struct Expected {
-    std::vector<SentPacket> forwarded;  // types 1..3, whole, without the type byte
-    size_t stop = 0;                    // bytes the pump consumes before it ends
-    bool bad_type = false;              // it ends at a type byte outside 1..4
+    std::vector<SentPacket> forwarded;
+    size_t stop = 0;
+    bool bad_type = false;
 };
 
-// Reference reading of an H4 stream (Bluetooth Core Specification, Vol 4,
-// Part A): command 3-byte header with 8-bit length at [2], ACL 4-byte header
-// with 16-bit length at [2..3], SCO like command, event 2-byte header with
-// length at [1].
-Expected reference_parse(const Bytes& s) {
+Expected expected_of(const Bytes& s) {
+    ReferenceReading r = read_h4_reference(s);
     Expected e;
-    size_t at = 0;
-    while (at < s.size()) {
-        uint8_t type = s[at];
-        size_t header = type == 1 ? 3 : type == 2 ? 4 : type == 3 ? 3 : type == 4 ? 2 : 0;
-        if (header == 0) {
-            e.bad_type = true;
-            e.stop = at + 1;
-            return e;
-        }
-        size_t h = at + 1;
-        if (h + header > s.size()) break;
-        size_t payload = type == 2 ? s[h + 2] + 256u * s[h + 3] : type == 4 ? s[h + 1] : s[h + 2];
-        if (h + header + payload > s.size()) break;
-        if (type != 4) e.forwarded.push_back({type, Bytes(s.begin() + h, s.begin() + h + header + payload)});
-        at = h + header + payload;
+    for (const auto& p : r.packets) {
+        if (p.type != 4) e.forwarded.push_back({p.type, p.bytes});
     }
-    e.stop = s.size();
+    e.bad_type = r.bad_type;
+    e.stop = r.bad_type ? r.bad_at + 1 : s.size();
     return e;
 }
 
@@ -74,7 +65,7 @@ void write_stream(int fd, const Bytes& s, size_t chunk) {
         struct pollfd pfd = {fd, POLLOUT, 0};
         FUZZ_CHECK(poll(&pfd, 1, kBoundMs) == 1,
                    "the pump stopped reading after %zu of %zu bytes (pump ended: %d)", done, s.size(),
-                   fuzz_log_seen("Process tool OUT !!!"));
+                   g_log.contains(ANDROID_LOG_ERROR, "Process tool OUT !!!"));
     }
 }
 
@@ -92,10 +83,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     if (size < 1) return 0;
     size_t chunk = data[0];
     Bytes stream(data + 1, data + size);
-    Expected want = reference_parse(stream);
+    Expected want = expected_of(stream);
     Bytes written(stream.begin(), stream.begin() + std::min(stream.size(), want.stop + kTailAfterStop));
 
-    fuzz_log_reset();
+    g_log.clear();
     android::sp<FakeHal> hal = new FakeHal();
     hal->registerDefault();
     hidl_client_init();
@@ -103,7 +94,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
 
     write_stream(bt_fd, written, chunk);
     hidl_client_close_tool_end();
-    FUZZ_CHECK(fuzz_log_wait("Process tool OUT !!!", kBoundMs), "the pump did not end");
+    FUZZ_CHECK(g_log.waitFor(ANDROID_LOG_ERROR, "Process tool OUT !!!", kBoundMs), "the pump did not end");
 
     std::vector<SentPacket> got = hal->sent();
     FUZZ_CHECK(got.size() == want.forwarded.size(), "%zu packets forwarded, %zu expected", got.size(),
@@ -116,7 +107,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     Bytes tail(written.begin() + std::min(written.size(), want.stop), written.end());
     FUZZ_CHECK(unread == tail, "%zu bytes left unread, %zu expected", unread.size(), tail.size());
     if (want.bad_type) {
-        FUZZ_CHECK(fuzz_log_seen("process_tool_data: Unsupported preamble_len packet type " +
+        FUZZ_CHECK(g_log.contains(ANDROID_LOG_ERROR, "process_tool_data: Unsupported preamble_len packet type " +
                                  std::to_string(stream[want.stop - 1])),
                    "no unsupported-type line");
     }

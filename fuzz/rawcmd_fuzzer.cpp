@@ -12,11 +12,14 @@
 
 #include "engine/hci_cmd.h"
 #include "fuzz/fuzz_check.h"
-#include "fuzz/fuzz_log.h"
+#include "tests/support/log_capture.h"
 
 using Bytes = std::vector<uint8_t>;
 
 namespace {
+
+// Keeps the library's many lines off stderr and lets the checks look them up.
+LogCapture g_log;
 
 const int kMaxParams = 252;  // 4 header bytes + 252 fill the 256-byte packet area
 
@@ -113,7 +116,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     FUZZ_CHECK(socketpair(AF_UNIX, SOCK_STREAM, 0, fds) == 0, "socketpair");
     // No reply will come: the reply-reading forms see the end of the stream.
     shutdown(fds[1], SHUT_WR);
-    fuzz_log_reset();
+    g_log.clear();
 
     int rc = -2;
     Bytes want;
