@@ -5,6 +5,11 @@
 using android::sp;
 using android::hardware::hidl_vec;
 using android::hardware::Void;
+using TransportStatus = android::hardware::Status;
+
+static TransportStatus deadObject() {
+    return TransportStatus::fromExceptionCode(TransportStatus::EX_TRANSACTION_FAILED);
+}
 
 FakeHal::FakeHal(InitMode mode, FakeHal::Status status) : mode_(mode), status_(status) {}
 
@@ -16,10 +21,41 @@ void FakeHal::registerDefault() { registerAsService("default"); }
 
 void FakeHal::unregisterDefault() { IBluetoothHci::unregisterService("default"); }
 
+void FakeHal::dieAt(Call call) {
+    std::lock_guard<std::mutex> guard(lock_);
+    dieAt_ = call;
+}
+
+void FakeHal::die() {
+    {
+        std::lock_guard<std::mutex> guard(lock_);
+        dead_ = true;
+    }
+    notifyServiceDied();
+}
+
+bool FakeHal::diesAt(Call call) {
+    {
+        std::lock_guard<std::mutex> guard(lock_);
+        if (dead_) return true;
+        if (call != dieAt_) return false;
+    }
+    die();
+    return true;
+}
+
+FakeHal::Return<bool> FakeHal::linkToDeath(const sp<android::hardware::hidl_death_recipient>& recipient,
+                                           uint64_t cookie) {
+    if (diesAt(Call::LinkToDeath)) return deadObject();
+    return IBluetoothHci::linkToDeath(recipient, cookie);
+}
+
 FakeHal::Return<void> FakeHal::initialize(const sp<Callbacks>& callback) {
+    if (diesAt(Call::Initialize)) return deadObject();
     {
         std::lock_guard<std::mutex> guard(lock_);
         callbacks_ = callback;
+        closed_ = false;
         ++initializeCalls_;
         changed_.notify_all();
     }
@@ -37,10 +73,11 @@ FakeHal::Return<void> FakeHal::initialize(const sp<Callbacks>& callback) {
 }
 
 FakeHal::Return<void> FakeHal::record(uint8_t type, const hidl_vec<uint8_t>& p) {
+    if (diesAt(Call::Send)) return deadObject();
     SentPacket packet{type, Bytes(p.begin(), p.end())};
     {
         std::lock_guard<std::mutex> guard(lock_);
-        if (closeCalls_ > 0) sentAfterClose_ = true;
+        if (closed_) sentAfterClose_ = true;
         sent_.push_back(packet);
         changed_.notify_all();
     }
@@ -53,11 +90,13 @@ FakeHal::Return<void> FakeHal::sendAclData(const hidl_vec<uint8_t>& p) { return 
 FakeHal::Return<void> FakeHal::sendScoData(const hidl_vec<uint8_t>& p) { return record(3, p); }
 
 FakeHal::Return<void> FakeHal::close() {
-    std::lock_guard<std::mutex> guard(lock_);
-    ++closeCalls_;
-    changed_.notify_all();
-    using TransportStatus = android::hardware::Status;
-    if (closeReportsDead) return TransportStatus::fromExceptionCode(TransportStatus::EX_TRANSACTION_FAILED);
+    {
+        std::lock_guard<std::mutex> guard(lock_);
+        ++closeCalls_;
+        closed_ = true;
+        changed_.notify_all();
+    }
+    if (diesAt(Call::Close)) return deadObject();
     return Void();
 }
 

@@ -1,5 +1,6 @@
 // A scriptable IBluetoothHci for tests: answers initialize as told, records
-// every packet it is sent, and delivers packets through the callbacks.
+// every packet it is sent, delivers packets through the callbacks, and can
+// die at any call as a HAL process does.
 #pragma once
 
 #include <condition_variable>
@@ -25,6 +26,9 @@ class FakeHal : public android::hardware::bluetooth::V1_0::IBluetoothHci {
     using Bytes = std::vector<uint8_t>;
 
     enum class InitMode { Sync, Async, Never };
+    // The call at which the HAL dies: that call and every later one fail with
+    // a transport error, and death recipients are told.
+    enum class Call { None, LinkToDeath, Initialize, Send, Close };
 
     FakeHal(InitMode mode = InitMode::Sync, Status status = Status::SUCCESS);
     ~FakeHal() override;
@@ -38,10 +42,14 @@ class FakeHal : public android::hardware::bluetooth::V1_0::IBluetoothHci {
     Return<void> sendAclData(const android::hardware::hidl_vec<uint8_t>& p) override;
     Return<void> sendScoData(const android::hardware::hidl_vec<uint8_t>& p) override;
     Return<void> close() override;
+    Return<bool> linkToDeath(const android::sp<android::hardware::hidl_death_recipient>& recipient,
+                             uint64_t cookie) override;
 
     // Called (on the pump thread) for every packet sent; may answer through callbacks().
     std::function<void(FakeHal&, const SentPacket&)> onSend;
-    bool closeReportsDead = false;
+    void dieAt(Call call);
+    // Dies now, between calls.
+    void die();
 
     android::sp<Callbacks> callbacks();
     std::vector<SentPacket> sent();
@@ -49,7 +57,7 @@ class FakeHal : public android::hardware::bluetooth::V1_0::IBluetoothHci {
     bool waitForInitialize(int timeout_ms = 5000);
     int initializeCalls();
     int closeCalls();
-    // True if any packet reached this HAL after its close().
+    // True if any packet reached this HAL between a close() and the next initialize().
     bool sentAfterClose();
 
     void deliverEvent(const Bytes& event);
@@ -58,6 +66,8 @@ class FakeHal : public android::hardware::bluetooth::V1_0::IBluetoothHci {
 
   private:
     Return<void> record(uint8_t type, const android::hardware::hidl_vec<uint8_t>& p);
+    // True when `call` finds the HAL dead, or kills it.
+    bool diesAt(Call call);
 
     InitMode mode_;
     Status status_;
@@ -69,4 +79,7 @@ class FakeHal : public android::hardware::bluetooth::V1_0::IBluetoothHci {
     int initializeCalls_ = 0;
     int closeCalls_ = 0;
     bool sentAfterClose_ = false;
+    bool closed_ = false;
+    Call dieAt_ = Call::None;
+    bool dead_ = false;
 };

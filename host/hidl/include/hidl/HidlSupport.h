@@ -1,6 +1,7 @@
 // Host stand-in for the HIDL runtime's support types: the byte vector that
-// carries packets across IBluetoothHci. Mirrors the platform API closely
-// enough that code written against it builds unchanged on a device.
+// carries packets across IBluetoothHci, and the death recipient. Mirrors the
+// platform API closely enough that code written against it builds unchanged
+// on a device.
 #pragma once
 
 #include <cstddef>
@@ -9,8 +10,24 @@
 #include <initializer_list>
 #include <vector>
 
+#include <utils/RefBase.h>
+
 namespace android {
+namespace hidl {
+namespace base {
+namespace V1_0 {
+struct IBase;
+}  // namespace V1_0
+}  // namespace base
+}  // namespace hidl
+
 namespace hardware {
+
+// Told when a service it was linked to (IBase::linkToDeath) has died.
+struct hidl_death_recipient : public virtual RefBase {
+    virtual void serviceDied(uint64_t cookie,
+                             const ::android::wp<::android::hidl::base::V1_0::IBase>& who) = 0;
+};
 
 template <typename T>
 class hidl_vec {

@@ -32,8 +32,15 @@ struct IBluetoothHci : public ::android::hidl::base::V1_0::IBase {
             const ::android::hardware::hidl_vec<uint8_t>& data) = 0;
     virtual ::android::hardware::Return<void> close() = 0;
 
+    // The argument forms of the platform's generated code.
     static ::android::sp<IBluetoothHci> getService(const std::string& serviceName = "default",
                                                    bool getStub = false);
+    static ::android::sp<IBluetoothHci> getService(const char serviceName[], bool getStub = false) {
+        return getService(std::string(serviceName != nullptr ? serviceName : ""), getStub);
+    }
+    static ::android::sp<IBluetoothHci> getService(bool getStub) {
+        return getService(std::string("default"), getStub);
+    }
     // A later registration under the same name replaces the earlier one.
     ::android::status_t registerAsService(const std::string& serviceName = "default");
     // Host only (tests): forget the service registered under a name.
