@@ -25,9 +25,12 @@ enum {
 enum EventOutcome { EVENT_ENDS_EXCHANGE, EVENT_READ_ON };
 
 // Wider than any 16-bit opcode: every reply is taken as the awaited one.
-static const int kAnyOpcode = -1;
 // Result of a read that timed out; the time-out has been logged already.
 static const ssize_t kTimedOut = -2;
+// LE Test End (Core Specification Vol 4, Part E, 7.8.30): its Command Complete
+// returns Status and Num_Packets, 6 parameter bytes in all.
+static const int kLeTestEndOpcode = 0x201F;
+static const int kLeTestEndReplyLen = 6;
 
 static long now_ms() {
     struct timespec ts;
@@ -50,14 +53,14 @@ static bool wait_readable(int fd, long deadline, const char* what) {
     }
 }
 
-// A controller that never answers must not hold the Java thread: no read waits
-// longer than HCI_REPLY_TIMEOUT_MS. The rest of an event arrives with its type
-// byte, so on a socket it is taken at once and the wait is paid only when it
-// is not there; a type byte is rarely there yet (the controller has just been
-// asked), so it is waited for first, as on any other descriptor. A closed or
-// invalid descriptor is left to the read to report.
-static ssize_t timed_read(int fd, uint8_t* dst, size_t len, const char* what, bool wait_first) {
-    long deadline = now_ms() + HCI_REPLY_TIMEOUT_MS;
+// A controller that never answers must not hold the Java thread: no read goes
+// past the deadline. The rest of an event arrives with its type byte, so on a
+// socket it is taken at once and the wait is paid only when it is not there;
+// a type byte is rarely there yet (the controller has just been asked), so it
+// is waited for first, as on any other descriptor. A closed or invalid
+// descriptor is left to the read to report.
+static ssize_t timed_read(int fd, uint8_t* dst, size_t len, const char* what, bool wait_first,
+                          long deadline) {
     bool try_first = !wait_first;
     for (;;) {
         if (try_first) {
@@ -74,10 +77,10 @@ static ssize_t timed_read(int fd, uint8_t* dst, size_t len, const char* what, bo
 }
 
 // Reads exactly len bytes; len, or the result of the read that failed.
-static ssize_t read_full(int fd, uint8_t* dst, int len, const char* what) {
+static ssize_t read_full(int fd, uint8_t* dst, int len, const char* what, long deadline) {
     int done = 0;
     while (done < len) {
-        ssize_t n = timed_read(fd, dst + done, len - done, what, false);
+        ssize_t n = timed_read(fd, dst + done, len - done, what, false, deadline);
         if (n < 1) return n;
         done += static_cast<int>(n);
     }
@@ -93,46 +96,16 @@ static void dump_event(const uint8_t* buf, int len) {
     LOGI("\n");
 }
 
-// A Command Complete or Command Status names the command it answers
-// (Bluetooth Core Specification Vol 4, Part E, 7.7.14 and 7.7.15). One for
-// another command is a late answer to an exchange that timed out, and must
-// not end this one.
-static bool is_late_reply(const uint8_t* buf, int len, int opcode) {
-    if (opcode == kAnyOpcode) return false;
-    int answered = -1;
-    if (buf[0] == EVT_COMMAND_COMPLETE && len >= 3) answered = buf[3] | (buf[4] << 8);
-    else if (buf[0] == EVT_COMMAND_STATUS && len >= 4) answered = buf[4] | (buf[5] << 8);
-    else if (buf[0] != EVT_COMMAND_COMPLETE && buf[0] != EVT_COMMAND_STATUS) return false;
-    if (answered == opcode) return false;
-    LOGI("%s: event 0x%x does not answer opcode 0x%04x, skipped", "read_incoming_events", buf[0],
-         opcode);
-    dump_event(buf, len);
-    return true;
-}
-
-// Status 0x00 means the command is pending and another event follows; any
-// other status is a rejection, after which the controller sends nothing more
-// for this command.
-static EventOutcome on_command_status(const uint8_t* buf, int len) {
-    LOGI("Command Status Received\n");
-    dump_event(buf, len);
-    uint8_t status = buf[2];
-    if (status == 0x00) return EVENT_READ_ON;
-    if (status == 0x02) LOGI("\nUnknown connection identifier");
-    else LOGI("%s: command rejected with status 0x%x", "read_incoming_events", status);
-    return EVENT_ENDS_EXCHANGE;
-}
-
-static EventOutcome on_event(uint8_t* buf, int len) {
+// The heading of the event by its code, then its bytes.
+static void log_event(const uint8_t* buf, int len) {
     switch (buf[0]) {
         case EVT_INQUIRY_COMPLETE:
             LOGI("INQ COMPLETE EVENT RECEIVED\n");
             LOGI("\n");
-            return EVENT_ENDS_EXCHANGE;
+            return;
         case EVT_INQUIRY_RESULT:
             LOGI("INQ RESULT EVENT RECEIVED \n");
-            dump_event(buf, len);
-            return EVENT_READ_ON;
+            break;
         case EVT_CONNECTION_COMPLETE:
             if (buf[2] != 0) {
                 LOGI("CONNECTION COMPLETE EVENT RECEIVED WITH ERROR CODE 0x%x \n", buf[2]);
@@ -140,26 +113,74 @@ static EventOutcome on_event(uint8_t* buf, int len) {
                 LOGI("CONNECTION COMPLETE EVENT RECEIVED WITH HANDLE: 0x%02x%02x \n",
                      param(buf, len, 4), param(buf, len, 3));
             }
-            dump_event(buf, len);
-            return EVENT_ENDS_EXCHANGE;
+            break;
         case EVT_DISCONNECTION_COMPLETE:
             LOGI("DISCONNECTION COMPLETE EVENT RECEIVED WITH REASON CODE: 0x%x \n",
                  param(buf, len, 5));
-            dump_event(buf, len);
-            return EVENT_ENDS_EXCHANGE;
+            break;
         case EVT_COMMAND_STATUS:
-            return on_command_status(buf, len);
+            LOGI("Command Status Received\n");
+            dump_event(buf, len);
+            if (buf[2] == 0x02) LOGI("\nUnknown connection identifier");
+            return;
         default:
             LOGI("Other event received, Breaking\n");
-            dump_event(buf, len);
+    }
+    dump_event(buf, len);
+}
+
+// For outside callers, which wait for whatever ends an exchange: Inquiry
+// Result and a pending Command Status (0x00) read on; a Command Status with
+// any other status is a rejection, after which the controller sends nothing
+// more for that command.
+static EventOutcome outcome_of(uint8_t* buf, int len) {
+    switch (buf[0]) {
+        case EVT_INQUIRY_RESULT:
+            return EVENT_READ_ON;
+        case EVT_COMMAND_STATUS:
+            if (buf[2] == 0x00) return EVENT_READ_ON;
+            if (buf[2] != 0x02) {
+                LOGI("%s: command rejected with status 0x%x", "read_incoming_events", buf[2]);
+            }
+            return EVENT_ENDS_EXCHANGE;
+        case EVT_INQUIRY_COMPLETE:
+        case EVT_CONNECTION_COMPLETE:
+        case EVT_DISCONNECTION_COMPLETE:
+            return EVENT_ENDS_EXCHANGE;
+        default:
             onReceivedTestData(buf, len + 2);
             return EVENT_ENDS_EXCHANGE;
     }
 }
 
+// The command a Command Complete or Command Status answers, when it holds the
+// opcode and a status (Core Specification Vol 4, Part E, 7.7.14 and 7.7.15);
+// -1 for every other event.
+static int answered_opcode(const uint8_t* buf, int len) {
+    if (len < 4) return -1;
+    if (buf[0] == EVT_COMMAND_COMPLETE) return buf[3] | (buf[4] << 8);
+    if (buf[0] == EVT_COMMAND_STATUS) return buf[4] | (buf[5] << 8);
+    return -1;
+}
+
+// An accepted Command Complete goes to the up-call, which reads its value from
+// the last two bytes it is given: LE Test End's is cut right after
+// Num_Packets, and one too short to hold the count is not handed on.
+static void hand_on_reply(uint8_t* buf, int len, int opcode) {
+    if (opcode != kLeTestEndOpcode) {
+        onReceivedTestData(buf, len + 2);
+        return;
+    }
+    if (len < kLeTestEndReplyLen) {
+        LOGE("%s: LE Test End answered without Num_Packets", "read_incoming_events");
+        return;
+    }
+    onReceivedTestData(buf, kLeTestEndReplyLen + 2);
+}
+
 // Reads one event (its type byte already in buf[0]) into buf; 0 or -1.
-static int read_event_body(int fd, uint8_t* buf) {
-    ssize_t n = read_full(fd, buf, 2, "event header");
+static int read_event_body(int fd, uint8_t* buf, long deadline) {
+    ssize_t n = read_full(fd, buf, 2, "event header", deadline);
     if (n == kTimedOut) return -1;
     if (n < 1) {
         LOGI("read error \n");
@@ -170,7 +191,7 @@ static int read_event_body(int fd, uint8_t* buf) {
         LOGI("Zero len , invalid \n");
         return -1;
     }
-    n = read_full(fd, buf + 2, len, "event parameters");
+    n = read_full(fd, buf + 2, len, "event parameters", deadline);
     if (n == kTimedOut) return -1;
     if (n < 1) {
         LOGI("read error :size = %d\n", len);
@@ -179,21 +200,44 @@ static int read_event_body(int fd, uint8_t* buf) {
     return 0;
 }
 
-static int read_events(int fd, uint8_t* buf, int opcode) {
+// Reads the next event into buf; false when none could be read.
+static bool read_event(int fd, uint8_t* buf, long deadline) {
+    if (timed_read(fd, buf, 1, "packet type", true, deadline) < 1) return false;
+    if (buf[0] != H4_TYPE_EVENT) return false;
+    return read_event_body(fd, buf, deadline) == 0;
+}
+
+int read_incoming_events(int fd, uint8_t* buf, int) {
     if (buf == nullptr) {
         LOGE("%s: no reply buffer", "read_incoming_events");
         return -1;
     }
     for (;;) {
-        if (timed_read(fd, buf, 1, "packet type", true) < 1) return -1;
-        if (buf[0] != H4_TYPE_EVENT) return -1;
-        if (read_event_body(fd, buf) == -1) return -1;
-        int len = buf[1];
-        if (is_late_reply(buf, len, opcode)) continue;
-        if (on_event(buf, len) == EVENT_ENDS_EXCHANGE) return 0;
+        if (!read_event(fd, buf, now_ms() + HCI_REPLY_TIMEOUT_MS)) return -1;
+        log_event(buf, buf[1]);
+        if (outcome_of(buf, buf[1]) == EVENT_ENDS_EXCHANGE) return 0;
     }
 }
 
-int read_incoming_events(int fd, uint8_t* buf, int) { return read_events(fd, buf, kAnyOpcode); }
-
-int read_command_reply(int fd, uint8_t* buf, uint16_t opcode) { return read_events(fd, buf, opcode); }
+// Only the command's own reply decides: whatever else the controller sends
+// meanwhile (its own events, a tester's, a late reply to an earlier command)
+// is logged and skipped, within one time-out for the whole exchange.
+int read_command_reply(int fd, uint8_t* buf, uint16_t opcode) {
+    long deadline = now_ms() + HCI_REPLY_TIMEOUT_MS;
+    for (;;) {
+        if (!read_event(fd, buf, deadline)) return HCI_NOT_ANSWERED;
+        int len = buf[1];
+        log_event(buf, len);
+        if (answered_opcode(buf, len) != opcode) {
+            LOGI("%s: event 0x%x does not answer opcode 0x%04x, skipped", "read_incoming_events",
+                 buf[0], opcode);
+            continue;
+        }
+        bool complete = buf[0] == EVT_COMMAND_COMPLETE;
+        uint8_t status = complete ? buf[5] : buf[2];
+        // A pending Command Status is followed by the command's own event.
+        if (!complete && status == 0x00) continue;
+        if (complete && status == 0x00) hand_on_reply(buf, len, opcode);
+        return status;
+    }
+}

@@ -6,7 +6,7 @@
 
 #include "transport/export.h"
 
-// How long one wait for a reply byte may last: the usual HCI command time-out.
+// How long the controller has to answer: the usual HCI command time-out.
 #define HCI_REPLY_TIMEOUT_MS 2000
 
 extern "C" {
@@ -18,7 +18,12 @@ HALVENOR_EXPORT int read_incoming_events(int fd, uint8_t* buf, int);
 
 }  // extern "C"
 
-// As read_incoming_events, but a Command Complete or Command Status for any
-// other opcode than `opcode` is a late reply to an earlier command: it is
-// logged and skipped instead of ending the exchange.
+// Status of a command that was not sent or not answered.
+#define HCI_NOT_ANSWERED (-1)
+
+// Reads the reply to the command `opcode` just written, within one reply
+// time-out in all: its Command Complete, or a Command Status that refuses it.
+// Every other event is logged and skipped. The controller's status (0x00:
+// accepted), or HCI_NOT_ANSWERED. An accepted Command Complete goes on to the
+// Java up-call (LE Test End's only when it holds Num_Packets).
 int read_command_reply(int fd, uint8_t* buf, uint16_t opcode);

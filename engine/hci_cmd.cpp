@@ -45,7 +45,7 @@ static ssize_t read_if_waiting(int fd, uint8_t* dst, size_t len) {
 // Whatever is already waiting on fd arrived before this command was sent, so
 // it cannot answer it: a reply that came after its command timed out, or an
 // event nobody asked for. Dropped so the reader never takes it as the reply.
-static void drop_stale_input(int fd) {
+static void drop_stale_input(int fd, const char* caller) {
     uint8_t scratch[WORK_BUF_SIZE];
     int dropped = 0;
     while (dropped < MAX_STALE_BYTES) {
@@ -55,7 +55,7 @@ static void drop_stale_input(int fd) {
         if (n <= 0) break;
         dropped += static_cast<int>(n);
     }
-    if (dropped > 0) LOGI("%s: dropped %d stale bytes before the command", "hci_cmd", dropped);
+    if (dropped > 0) LOGI("%s: dropped %d stale bytes before the command", caller, dropped);
 }
 
 // The whole packet or failure: half a command would corrupt the stream. A
@@ -72,23 +72,24 @@ static bool write_packet(int fd, const uint8_t* packet, int len) {
 }
 
 // Reads the reply to the command just written from work, into work.
-static int read_reply(int fd, uint8_t* work, bool written) {
-    uint16_t opcode = static_cast<uint16_t>(work[1] | (work[2] << 8));
+static HciReply read_reply(int fd, uint8_t* work, bool written) {
+    HciReply reply = {static_cast<uint16_t>(work[1] | (work[2] << 8)), HCI_NOT_ANSWERED};
     memset(work, 0, WORK_BUF_SIZE);
-    int rc = written ? read_command_reply(fd, work, opcode) : -1;
+    if (written) reply.status = read_command_reply(fd, work, reply.opcode);
     LOGI("\n");
-    return rc;
+    return reply;
 }
 
 static uint8_t hex_byte(const char* token) { return static_cast<uint8_t>(strtol(token, nullptr, 16)); }
 
-int cmd_rawcmd(int fd, int argc, const char* const* argv) {
-    if (argv == nullptr || argc < 3) return -1;
+HciReply cmd_rawcmd(int fd, int argc, const char* const* argv) {
+    HciReply none = {0, HCI_NOT_ANSWERED};
+    if (argv == nullptr || argc < 3) return none;
     int plen = argc - 3;
     if (plen > MAX_PARAMS) {
         LOGE("%s: %d parameters do not fit one command (at most %d), nothing sent", "cmd_rawcmd",
              plen, MAX_PARAMS);
-        return -1;
+        return none;
     }
     uint16_t ogf = static_cast<uint16_t>(strtol(argv[1], nullptr, 16));
     uint16_t ocf = static_cast<uint16_t>(strtol(argv[2], nullptr, 16));
@@ -101,28 +102,32 @@ int cmd_rawcmd(int fd, int argc, const char* const* argv) {
 
     uint8_t work[WORK_BUF_SIZE];
     int len = build_packet(work, ogf, ocf, static_cast<uint8_t>(plen), params);
-    drop_stale_input(fd);
+    drop_stale_input(fd, "cmd_rawcmd");
     bool written = write_packet(fd, work, len);
     LOGI("Raw HCI command\n");
     return read_reply(fd, work, written);
 }
 
-int hci_send_cmd_rawcmd(int fd, uint16_t ogf, uint16_t ocf, uint8_t plen, char* params) {
+HciReply hci_cmd_exchange(int fd, uint16_t ogf, uint16_t ocf, uint8_t plen, const char* params) {
     LOGI("ogf 0x%x ocf 0x%x \nParams: ", ogf, ocf);
     LOGI("dev_id = %d: ", fd);
     if (plen > 0 && params == nullptr) {
         LOGE("%s: %d parameter bytes announced, none given", "hci_send_cmd_rawcmd", plen);
-        return -1;
+        return {0, HCI_NOT_ANSWERED};
     }
     for (int i = 0; i < plen; ++i) LOGI("0x%x ", static_cast<uint8_t>(params[i]));
     LOGI("\n");
 
     uint8_t work[WORK_BUF_SIZE];
     int len = build_packet(work, ogf, ocf, plen, reinterpret_cast<const uint8_t*>(params));
-    drop_stale_input(fd);
+    drop_stale_input(fd, "hci_send_cmd_rawcmd");
     bool written = write_packet(fd, work, len);
     LOGI("Raw HCI command\n\n");
     return read_reply(fd, work, written);
+}
+
+int hci_send_cmd_rawcmd(int fd, uint16_t ogf, uint16_t ocf, uint8_t plen, char* params) {
+    return hci_cmd_exchange(fd, ogf, ocf, plen, params).status == HCI_NOT_ANSWERED ? -1 : 0;
 }
 
 int hci_send_cmd(int fd, uint16_t ogf, uint16_t ocf, uint8_t plen, void* params) {

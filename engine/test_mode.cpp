@@ -3,6 +3,7 @@
 // Run on the Java thread of the calling native method, one at a time.
 #include "engine/test_mode.h"
 
+#include <poll.h>
 #include <stdio.h>
 
 #include "engine/hci_cmd.h"
@@ -64,16 +65,19 @@ struct DutCommand {
     uint16_t ocf;
     uint8_t plen;
     char params[3];
+    // Off by default, and dropped by newer controllers (Write Encryption
+    // Mode is deprecated): a refusal does not keep the device out of the mode.
+    bool may_refuse;
 };
 
 // Device Under Test entry, in order (Core Specification Vol 4, Part E, 7.6.3,
 // 7.3.3, 7.3.18, 7.3.24, 7.3.26).
 static const DutCommand kDutEntry[] = {
-        {0x06, 0x0003, 0, {0}},           // Enable Device Under Test Mode
-        {0x03, 0x0005, 3, {2, 0, 2}},     // Set Event Filter: auto-accept all connections
-        {0x03, 0x001A, 1, {3}},           // Write Scan Enable: inquiry and page scan
-        {0x03, 0x0020, 1, {0}},           // Write Authentication Enable: off
-        {0x03, 0x0022, 1, {0}},           // Write Encryption Mode: off
+        {0x06, 0x0003, 0, {0}, false},        // Enable Device Under Test Mode
+        {0x03, 0x0005, 3, {2, 0, 2}, false},  // Set Event Filter: auto-accept all connections
+        {0x03, 0x001A, 1, {3}, false},        // Write Scan Enable: inquiry and page scan
+        {0x03, 0x0020, 1, {0}, true},         // Write Authentication Enable: off
+        {0x03, 0x0022, 1, {0}, true},         // Write Encryption Mode: off
 };
 
 static const BleTest* find_ble_test(int code) {
@@ -83,8 +87,27 @@ static const BleTest* find_ble_test(int code) {
     return nullptr;
 }
 
-// Opens a HAL session into bt_fd unless one is open; true when bt_fd is usable.
-static bool ensure_session() {
+// The tool end first: the pump sees the end of the stream and stops, then the
+// session is closed behind it.
+static void end_session() {
+    hidl_client_close_tool_end();
+    hidl_client_close();
+}
+
+// Once the bridge has ended (the HAL died, or the pump stopped) the session
+// can carry nothing more.
+static bool session_ended(int fd) {
+    struct pollfd pfd = {fd, POLLRDHUP, 0};
+    return poll(&pfd, 1, 0) == 1 && (pfd.revents & (POLLRDHUP | POLLHUP | POLLERR | POLLNVAL));
+}
+
+// Opens a HAL session into bt_fd unless one is open and alive; true when
+// bt_fd is usable.
+static bool ensure_session(const char* caller) {
+    if (bt_fd >= 0 && session_ended(bt_fd)) {
+        LOGE("%s: the controller session had ended, opening a new one", caller);
+        end_session();
+    }
     if (bt_fd < 0) hidl_client_init();
     return bt_fd >= 0;
 }
@@ -98,19 +121,24 @@ void sendBleTestCommand(int code, uint8_t enhanced) {
         return;
     }
     if (code == kTestEndCode) cmd_test_end_flag = 1;
-    if (!ensure_session()) {
+    if (!ensure_session("sendBleTestCommand")) {
         LOGE("sendBleTestCommand, init smd error return!!!");
         return;
     }
     LOGI("sendBleTestCommand, init smd successful");
 
-    int rc = enhanced != 0 ? cmd_rawcmd(bt_fd, test->phy2m_count, test->phy2m)
-                           : cmd_rawcmd(bt_fd, test->plain_count, test->plain);
-    // The flag belongs to this exchange only: a test end that was rejected or
+    HciReply reply = enhanced != 0 ? cmd_rawcmd(bt_fd, test->phy2m_count, test->phy2m)
+                                   : cmd_rawcmd(bt_fd, test->plain_count, test->plain);
+    // The flag belongs to this exchange only: a test end that was refused or
     // never answered must not turn the next command's reply into a count.
     cmd_test_end_flag = 0;
-    if (rc != 0) {
+    if (reply.status == HCI_NOT_ANSWERED) {
         LOGE("sendBleTestCommand, command %d not answered return!!!", code);
+        return;
+    }
+    if (reply.status != 0) {
+        LOGE("sendBleTestCommand, command %d (opcode 0x%04x) refused with status 0x%02x return!!!",
+             code, reply.opcode, reply.status);
         return;
     }
     onSendCmdSuccess(code);
@@ -124,7 +152,7 @@ void sendCwtxCommandNative(JNIEnv*, jobject, jint channel, jint power, jint type
         LOGE("sendCwtxCommandNative, channel, power and type must be 0 to 255 return!!!");
         return;
     }
-    if (!ensure_session()) {
+    if (!ensure_session("sendCwtxCommandNative")) {
         LOGE("init bt_fd error return!!!");
         return;
     }
@@ -138,14 +166,38 @@ void sendCwtxCommandNative(JNIEnv*, jobject, jint channel, jint power, jint type
         snprintf(fields[i], sizeof(fields[i]), "0x%x", static_cast<unsigned>(values[i]));
         tokens[4 + i] = fields[i];
     }
-    if (cmd_rawcmd(bt_fd, kCwTokens, tokens) != 0) {
-        LOGE("sendCwtxCommandNative, command not answered return!!!");
+    HciReply reply = cmd_rawcmd(bt_fd, kCwTokens, tokens);
+    if (reply.status == HCI_NOT_ANSWERED) {
+        LOGE("sendCwtxCommandNative, command 0x%04x not answered return!!!", reply.opcode);
+    } else if (reply.status != 0) {
+        LOGE("sendCwtxCommandNative, command 0x%04x refused with status 0x%02x return!!!",
+             reply.opcode, reply.status);
     }
+}
+
+// Sends one command of the entry; false when the entry cannot go on.
+static bool enter_step(const DutCommand& cmd) {
+    char params[sizeof(cmd.params)];
+    for (size_t i = 0; i < sizeof(params); ++i) params[i] = cmd.params[i];
+    HciReply reply = hci_cmd_exchange(bt_fd, cmd.ogf, cmd.ocf, cmd.plen, params);
+    if (reply.status == HCI_NOT_ANSWERED) {
+        LOGE("enterTestMode, command 0x%04x not answered return!!!", reply.opcode);
+        return false;
+    }
+    if (reply.status == 0) return true;
+    if (cmd.may_refuse) {
+        LOGI("enterTestMode, command 0x%04x refused with status 0x%02x, not needed, going on",
+             reply.opcode, reply.status);
+        return true;
+    }
+    LOGE("enterTestMode, command 0x%04x refused with status 0x%02x return!!!", reply.opcode,
+         reply.status);
+    return false;
 }
 
 int hci_enable_device_under_test_mode() {
     LOGI("enterTestMode, hci_enable_device_under_test_mode IN.\n");
-    if (!ensure_session()) {
+    if (!ensure_session("enterTestMode")) {
         LOGE("init bt_fd error return!!!");
         return -1;
     }
@@ -153,13 +205,12 @@ int hci_enable_device_under_test_mode() {
     LOGE("start send com to bt device!!!\n");
 
     for (const DutCommand& cmd : kDutEntry) {
-        char params[sizeof(cmd.params)];
-        for (size_t i = 0; i < sizeof(params); ++i) params[i] = cmd.params[i];
-        if (hci_send_cmd_rawcmd(bt_fd, cmd.ogf, cmd.ocf, cmd.plen, params) != 0) {
-            LOGE("enterTestMode, command ogf 0x%x ocf 0x%x not answered return!!!", cmd.ogf,
-                 cmd.ocf);
-            return -1;
-        }
+        if (enter_step(cmd)) continue;
+        // Half an entry is no mode: the controller is reset (it may not answer)
+        // and the session ended, so -1 always means neither is left.
+        hci_cmd_exchange(bt_fd, 0x03, 0x0003, 0, nullptr);
+        end_session();
+        return -1;
     }
     LOGI("enterTestMode, hci_enable_device_under_test_mode OUT!!!\n");
     return 0;
@@ -168,10 +219,7 @@ int hci_enable_device_under_test_mode() {
 int hci_disable_device_under_test_mode() {
     LOGE("quitTestMode, hci_disable_device_under_test_mode IN.\nbt_fd = %d", bt_fd);
     hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0003, 0, nullptr);
-    // The tool end first: the pump sees the end of the stream and stops, then
-    // the session is closed behind it.
-    hidl_client_close_tool_end();
-    hidl_client_close();
+    end_session();
     LOGI("quitTestMode, hci_disable_device_under_test_mode OUT!!!\n");
     return 0;
 }

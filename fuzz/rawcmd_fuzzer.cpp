@@ -85,7 +85,7 @@ Bytes run_tokens(int fd, const std::vector<std::string>& tokens, int* rc) {
     std::vector<const char*> argv;
     for (const auto& t : tokens) argv.push_back(t.c_str());
     int argc = static_cast<int>(argv.size());
-    *rc = cmd_rawcmd(fd, argc, argv.data());
+    *rc = cmd_rawcmd(fd, argc, argv.data()).status;
     if (argc < 3 || argc - 3 > kMaxParams) return {};
     Bytes params;
     for (int i = 3; i < argc; ++i) params.push_back(static_cast<uint8_t>(reference_strtol16(tokens[i])));

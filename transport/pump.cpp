@@ -127,38 +127,43 @@ static bool read_packet(int fd, uint8_t* type, std::vector<uint8_t>& packet) {
     return true;
 }
 
-static void forward_packet(uint8_t type, uint8_t* packet, size_t len) {
+// False when the HAL has died: nothing more can reach the controller.
+static bool forward_packet(uint8_t type, uint8_t* packet, size_t len) {
     LOGE("PACKET_TYPE = %d", type);
     if (type == H4_TYPE_EVENT) {
         LOGE("%s: Unsupported packet type: %d", "process_tool_data", type);
-        return;
+        return true;
     }
     // Every session change joins the pump before it touches btHci, so the
     // service read here is the one this session opened.
     if (btHci == nullptr) {
         LOGE("%s: no HAL service, packet dropped", "process_tool_data");
-        return;
+        return true;
     }
     hidl_vec<uint8_t> hci;
     hci.setToExternal(packet, len);
     Return<void> sent = type == H4_TYPE_COMMAND ? btHci->sendHciCommand(hci)
                         : type == H4_TYPE_ACL   ? btHci->sendAclData(hci)
                                                 : btHci->sendScoData(hci);
-    if (!sent.isOk()) LOGE("%s: the HAL refused packet type %d", "process_tool_data", type);
+    if (sent.isOk()) return true;
+    LOGE("%s: the HAL refused packet type %d: %s", "process_tool_data", type,
+         sent.description().c_str());
+    return !sent.isDeadObject();
 }
 
 // The packets taken at once are logged as one by one: the lines safe_read and
-// read_packet would give for each, in the same order.
-static void forward_batch(uint8_t* bytes, size_t len) {
+// read_packet would give for each, in the same order. False when the HAL died.
+static bool forward_batch(uint8_t* bytes, size_t len) {
     for (size_t at = 0; at < len;) {
         uint8_t type = bytes[at];
         size_t packet_len = whole_packet_len(bytes + at, len - at);
-        if (packet_len == 0) return;
+        if (packet_len == 0) return true;
         LOGI("%s: Packet type :%d", "process_tool_data", type);
         if (packet_len == 1u + preamble_len_table[type - 1]) LOGE("%s: No data to read", "safe_read");
-        forward_packet(type, bytes + at + 1, packet_len - 1);
+        if (!forward_packet(type, bytes + at + 1, packet_len - 1)) return false;
         at += packet_len;
     }
+    return true;
 }
 
 void* process_tool_data(void*) {
@@ -182,8 +187,7 @@ void* process_tool_data(void*) {
         size_t whole = peeked > 0 ? whole_packets_len(batch.data(), peeked) : 0;
         if (whole > 0) {
             size_t taken = take_peeked(fd, batch, whole);
-            forward_batch(batch.data(), taken);
-            if (taken < whole) break;
+            if (!forward_batch(batch.data(), taken) || taken < whole) break;
             readable = false;
             continue;
         }
@@ -201,8 +205,11 @@ void* process_tool_data(void*) {
         uint8_t type = 0;
         if (!read_type_byte(fd, &type)) break;
         if (!read_packet(fd, &type, packet)) break;
-        forward_packet(type, packet.data(), packet.size());
+        if (!forward_packet(type, packet.data(), packet.size())) break;
     }
+    // Whatever ended the pump, the engine must see the bridge end at once
+    // rather than wait for replies that can no longer come.
+    shutdown(fd, SHUT_RDWR);
     LOGE("Process tool OUT !!!");
     return nullptr;
 }

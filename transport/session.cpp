@@ -19,9 +19,12 @@
 #include "transport/pump.h"
 
 using android::sp;
+using android::wp;
+using android::hardware::hidl_death_recipient;
 using android::hardware::hidl_vec;
 using android::hardware::Return;
 using android::hardware::Void;
+using android::hidl::base::V1_0::IBase;
 using android::hardware::bluetooth::V1_0::IBluetoothHci;
 using android::hardware::bluetooth::V1_0::IBluetoothHciCallbacks;
 using android::hardware::bluetooth::V1_0::Status;
@@ -40,16 +43,26 @@ static sem_t init_sem;
 static pthread_t tool_thread;
 static bool tool_thread_started = false;
 
-// Guards hidl_ready and which callback object may still end the current
-// initialisation wait, so a late answer to an abandoned opening is ignored.
+// Guards hidl_ready, which callback object may still end the current
+// initialisation wait (so a late answer to an abandoned opening is ignored),
+// and which service's death notice concerns the current session.
 static std::mutex init_lock;
 static const IBluetoothHciCallbacks* init_waiter = nullptr;
+static uint64_t session_cookie = 0;
 
 // Held while a callback writes to server_fd and while server_fd is replaced
 // or closed, so no callback writes into a closed or reused descriptor.
 static std::mutex bridge_lock;
 
 namespace {
+
+// Told when the HAL's process dies: the session cannot carry anything more,
+// so an opening waiting for the HAL gives up at once and the engine finds the
+// bridge ended instead of waiting out its time-outs.
+class HalDeathRecipient : public hidl_death_recipient {
+  public:
+    void serviceDied(uint64_t cookie, const wp<IBase>& who) override;
+};
 
 class BluetoothHciCallbacks : public IBluetoothHciCallbacks {
   public:
@@ -59,6 +72,13 @@ class BluetoothHciCallbacks : public IBluetoothHciCallbacks {
     Return<void> aclDataReceived(const hidl_vec<uint8_t>& data) override;
     Return<void> scoDataReceived(const hidl_vec<uint8_t>& data) override;
 };
+
+// Ends the opening's wait for the HAL; init_lock is held.
+void end_init_wait_locked(bool ready) {
+    hidl_ready = ready;
+    init_waiter = nullptr;
+    sem_post(&init_sem);
+}
 
 // Type byte and packet go out in one locked write: packets from callbacks on
 // several HAL threads never interleave in the stream.
@@ -82,9 +102,7 @@ Return<void> BluetoothHciCallbacks::initializationComplete(Status status) {
         LOGE("%s: answer to an abandoned opening ignored", "initializationComplete");
         return Void();
     }
-    hidl_ready = ok;
-    init_waiter = nullptr;
-    sem_post(&init_sem);
+    end_init_wait_locked(ok);
     return Void();
 }
 
@@ -103,7 +121,21 @@ Return<void> BluetoothHciCallbacks::scoDataReceived(const hidl_vec<uint8_t>& dat
     return Void();
 }
 
+void HalDeathRecipient::serviceDied(uint64_t cookie, const wp<IBase>&) {
+    {
+        std::lock_guard<std::mutex> guard(init_lock);
+        if (cookie != session_cookie) return;  // an earlier session's service
+        LOGE("%s: the Bluetooth HAL died", "serviceDied");
+        if (init_waiter != nullptr) end_init_wait_locked(false);
+    }
+    std::lock_guard<std::mutex> guard(bridge_lock);
+    if (server_fd != -1) shutdown(server_fd, SHUT_RDWR);
+}
+
 }  // namespace
+
+// Linked to the service of each session; the cookie names the session.
+static sp<hidl_death_recipient> hal_death;
 
 void hidl_client_close_tool_end() {
     if (client_fd != -1) close(client_fd);
@@ -126,9 +158,29 @@ void hidl_client_stop_bridge() {
     server_fd = -1;
 }
 
+// A dead service's unlink fails; there is nothing left to unlink then.
+static void unlink_death_notice() {
+    if (hal_death == nullptr) return;
+    Return<bool> unlinked = btHci->unlinkToDeath(hal_death);
+    unlinked.isOk();
+}
+
 void hidl_client_release_service(const char* caller) {
     if (btHci == nullptr) return;
+    unlink_death_notice();
     if (!btHci->close().isOk()) LOGI("%s: HIDL daemon is dead", caller);
+    btHci.clear();
+}
+
+// A failed opening gives back the service it obtained, closed when it was
+// initialised, so no HAL stays initialised behind a session that never was.
+// The opening has logged why it failed; a dead HAL's close adds nothing.
+static void abandon_service(bool initialised) {
+    unlink_death_notice();
+    if (initialised) {
+        Return<void> closed = btHci->close();
+        closed.isOk();
+    }
     btHci.clear();
 }
 
@@ -145,6 +197,30 @@ static bool arm_init_wait(const IBluetoothHciCallbacks* waiter) {
     hidl_ready = false;
     init_waiter = waiter;
     return sem_init(&init_sem, 0, 0) == 0;
+}
+
+static void disarm_init_wait() {
+    std::lock_guard<std::mutex> guard(init_lock);
+    init_waiter = nullptr;
+}
+
+// The death notice of the new service names a new session. A HAL that will
+// not give one still works; only its death is noticed later, at a send.
+static bool link_death_notice() {
+    uint64_t cookie;
+    {
+        std::lock_guard<std::mutex> guard(init_lock);
+        cookie = ++session_cookie;
+    }
+    if (hal_death == nullptr) hal_death = new HalDeathRecipient();
+    Return<bool> linked = btHci->linkToDeath(hal_death, cookie);
+    if (!linked.isOk()) {
+        LOGE("%s: the HAL died before initialize: %s", "hidl_client_initialize",
+             linked.description().c_str());
+        return false;
+    }
+    if (!linked) LOGI("%s: the HAL gives no death notice", "hidl_client_initialize");
+    return true;
 }
 
 // Waits, bounded, for initializationComplete; true when the HAL answered.
@@ -176,7 +252,12 @@ static bool initialize_hal() {
         LOGE("%s: sem_init failed: %s", "hidl_client_initialize", strerror(errno));
         return false;
     }
-    btHci->initialize(callbacks);
+    Return<void> started = btHci->initialize(callbacks);
+    if (!started.isOk()) {
+        disarm_init_wait();
+        LOGE("%s: initialize failed: %s", "hidl_client_initialize", started.description().c_str());
+        return false;
+    }
     return wait_for_init();
 }
 
@@ -220,14 +301,22 @@ bool hidl_client_initialize(int, int* tool_fd) {
     }
     LOGI("%s: IBluetoothHci::getService() returned %p (%s)", "hidl_client_initialize",
          btHci.get(), btHci->isRemote() ? "remote" : "local");
+    if (!link_death_notice()) {
+        abandon_service(false);
+        return false;
+    }
 
     if (!initialize_hal()) {
         LOGE("%s: HIDL failed to initialize, sending invalid FD to tool", "hidl_client_initialize");
+        abandon_service(true);
         return false;
     }
     LOGE("%s: HIDL = true", "hidl_client_initialize");
 
-    if (!open_bridge()) return false;
+    if (!open_bridge()) {
+        abandon_service(true);
+        return false;
+    }
     LOGE("Server FD=%d  Client FD: %d\n", server_fd, client_fd);
     *tool_fd = client_fd;
     return true;

@@ -27,7 +27,7 @@ class HciCmdTest : public HalSessionTest {
     int rawcmd(const std::vector<std::string>& tokens) {
         std::vector<const char*> argv;
         for (const std::string& t : tokens) argv.push_back(t.c_str());
-        return cmd_rawcmd(bt_fd, static_cast<int>(argv.size()), argv.data());
+        return cmd_rawcmd(bt_fd, static_cast<int>(argv.size()), argv.data()).status;
     }
 
     static long elapsedMs(std::chrono::steady_clock::time_point since) {
@@ -145,7 +145,7 @@ TEST_F(HciCmdTest, BinaryFormLogsFullFieldsDescriptorAndUnsignedBytes) {
 
 TEST_F(HciCmdTest, FailedWriteReadsNothingAndReturnsFailure) {
     EXPECT_EQ(hci_send_cmd_rawcmd(-1, 0x03, 0x0003, 0, nullptr), -1);
-    EXPECT_EQ(cmd_rawcmd(-1, 3, std::vector<const char*>{"rawcmd", "0x03", "0x0003"}.data()), -1);
+    EXPECT_EQ(cmd_rawcmd(-1, 3, std::vector<const char*>{"rawcmd", "0x03", "0x0003"}.data()).status, -1);
     EXPECT_EQ(log_.count(INFO, "Raw HCI command\n\n"), 1);
     EXPECT_EQ(log_.count(INFO, "\n"), 4);  // each form: after the parameters and at the end
     EXPECT_FALSE(log_.containsFragment("event"));
@@ -234,7 +234,7 @@ TEST(HciSendCmdTest, PeerGoneFailsWithoutSigpipe) {
     close(fds[1]);
     EXPECT_EQ(hci_send_cmd(fds[0], 0x03, 0x0003, 0, nullptr), -1);
     EXPECT_EQ(hci_send_cmd_rawcmd(fds[0], 0x03, 0x0003, 0, nullptr), -1);
-    EXPECT_EQ(cmd_rawcmd(fds[0], 3, std::vector<const char*>{"rawcmd", "0x08", "0x001F"}.data()), -1);
+    EXPECT_EQ(cmd_rawcmd(fds[0], 3, std::vector<const char*>{"rawcmd", "0x08", "0x001F"}.data()).status, -1);
     close(fds[0]);
     sigaction(SIGPIPE, &old, nullptr);
 }

@@ -1,12 +1,14 @@
+// The test procedures against a scripted controller: the bytes each sends,
+// and what reaches Java for every way the controller can answer.
 #include "engine/test_mode.h"
 
 #include <android/log.h>
 
-#include <chrono>
 #include <string>
 #include <vector>
 
 #include "tests/engine/hal_session.h"
+#include "tests/support/fake_java.h"
 #include "tests/support/process.h"
 
 namespace {
@@ -18,20 +20,22 @@ class TestModeTest : public HalSessionTest {
   protected:
     void SetUp() override {
         HalSessionTest::SetUp();
+        bindFakeJava();
         threads_ = countThreads();
     }
-    // Java is not bound in this suite: an up-call shows only as its first log line.
-    int successReports() const {
-        int n = 0;
-        for (const LogLine& line : log_.lines()) n += line.text.rfind("onSendCmdSuccess() command: ", 0) == 0;
-        return n;
-    }
-    static long msSince(std::chrono::steady_clock::time_point start) {
-        return static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(
-                std::chrono::steady_clock::now() - start).count());
+    // The commands the HAL received since `from`.
+    std::vector<Bytes> sentSince(size_t from) {
+        std::vector<Bytes> all = commandsSent(*hal_);
+        return std::vector<Bytes>(all.begin() + static_cast<long>(std::min(from, all.size())), all.end());
     }
     int threads_ = 0;
 };
+
+Bytes event(uint8_t code, const Bytes& params) {
+    Bytes e = {code, static_cast<uint8_t>(params.size())};
+    e.insert(e.end(), params.begin(), params.end());
+    return e;
+}
 
 struct BleCase {
     int code;
@@ -57,37 +61,69 @@ TEST_F(TestModeTest, EveryTestCodeSendsItsCommandByteExact) {
             {3000, true, {0x1F, 0x20, 0x00}},
     };
     for (const BleCase& c : cases) {
-        log_.clear();
-        sendBleTestCommand(c.code, c.enhanced ? 1 : 0);
+        sendBleTestCommand(c.code, c.enhanced ? 0x80 : 0);  // any non-zero byte selects LE 2M
         EXPECT_EQ(commandsSent(*hal_).back(), c.atHal) << c.code << " enhanced " << c.enhanced;
-        EXPECT_TRUE(log_.contains(INFO, "onSendCmdSuccess() command: " + std::to_string(c.code)));
+        EXPECT_EQ(takeJavaCalls(), "success " + std::to_string(c.code));
     }
     EXPECT_EQ(commandsSent(*hal_).size(), sizeof(cases) / sizeof(cases[0]));
     EXPECT_EQ(hal_->initializeCalls(), 1);  // one session, kept open across calls
 }
 
-TEST_F(TestModeTest, AnyNonZeroEnhancedByteSelectsThe2MPhy) {
-    sendBleTestCommand(22440, 0x80);
-    EXPECT_EQ(commandsSent(*hal_).back(), (Bytes{0x33, 0x20, 0x03, 0x13, 0x02, 0x00}));
-}
+// Controllers that are not scripted by the test never answer what they did not expect.
+const Bytes kHardwareError = event(0x10, {0x01});
+const Bytes kVendor = event(0xFF, {0x2A, 0x00});
+const Bytes kLeMeta = event(0x3E, {0x01, 0x2A, 0x00});
+const Bytes kCompletedPackets = event(0x13, {0x01, 0x40, 0x00, 0x2A, 0x00});
+const Bytes kConnection = event(0x03, {0x00, 0x40, 0x00, 1, 2, 3, 4, 5, 6, 0x01, 0x00});
+const Bytes kDisconnection = event(0x05, {0x00, 0x40, 0x00, 0x13});
+const Bytes kInquiryComplete = event(0x01, {0x00});
 
-TEST_F(TestModeTest, TestEndHandsOnTheCountBeforeReportingSuccess) {
-    const struct {
-        Bytes count;
-        std::string value;
-    } cases[] = {{{0x2A, 0x00}, "42"}, {{0xFF, 0xFF}, "65535"}};
-    for (const auto& c : cases) {
-        answerWith([c](const Bytes& command) {
-            Bytes returned = {0x00};
-            returned.insert(returned.end(), c.count.begin(), c.count.end());
-            return std::vector<Bytes>{commandComplete(opcodeOf(command), returned)};
-        });
+struct ReplyCase {
+    const char* name;
+    int code;
+    std::vector<Bytes> reply;  // what the controller sends after the command
+    std::string java;          // the callbacks that must reach Java, in order
+    std::string line;          // a line that must be logged at error priority, if any
+};
+
+// Java hears of a command only from its own reply: success when the
+// controller accepted it, a count only from LE Test End's accepted Command
+// Complete, and nothing from any other event however it looks.
+TEST_F(TestModeTest, OnlyTheCommandsOwnAcceptedReplyReachesJava) {
+    const ReplyCase cases[] = {
+            {"accepted", 22440, {commandComplete(0x2033)}, "success 22440", ""},
+            {"refused by its Command Complete", 22440, {commandComplete(0x2033, {0x11})}, "",
+             "sendBleTestCommand, command 22440 (opcode 0x2033) refused with status 0x11 return!!!"},
+            {"refused by a Command Status", 12402, {commandStatus(0x201E, 0x01)}, "",
+             "sendBleTestCommand, command 12402 (opcode 0x201e) refused with status 0x01 return!!!"},
+            {"pending, then complete", 12402, {commandStatus(0x201E, 0x00), commandComplete(0x201E)},
+             "success 12402", ""},
+            {"count", 3000, {commandComplete(0x201F, {0x00, 0x2A, 0x00})}, "received 42,success 3000", ""},
+            {"largest count", 3000, {commandComplete(0x201F, {0x00, 0xFF, 0xFF})},
+             "received 65535,success 3000", ""},
+            {"count after trailing bytes", 3000, {commandComplete(0x201F, {0x00, 0x2A, 0x00, 0x07, 0x07})},
+             "received 42,success 3000", ""},
+            {"test end refused", 3000, {commandComplete(0x201F, {0x0C, 0x2A, 0x00})}, "",
+             "sendBleTestCommand, command 3000 (opcode 0x201f) refused with status 0x0c return!!!"},
+            {"test end without a count", 3000, {commandComplete(0x201F)}, "success 3000",
+             "read_incoming_events: LE Test End answered without Num_Packets"},
+            {"events before and between the replies", 3000,
+             {kHardwareError, kVendor, kLeMeta, kCompletedPackets, commandComplete(0x201D, {0x00, 0x07, 0x00}),
+              kConnection, commandStatus(0x201F, 0x00), kDisconnection, kInquiryComplete,
+              commandComplete(0x201F, {0x00, 0x2A, 0x00})},
+             "received 42,success 3000", ""},
+            {"only other events", 3000, {kLeMeta, commandComplete(0x201D, {0x00, 0x2A, 0x00})}, "",
+             "sendBleTestCommand, command 3000 not answered return!!!"},
+    };
+    for (const ReplyCase& c : cases) {
+        answerWith([&c](const Bytes&) { return c.reply; });
         log_.clear();
-        sendBleTestCommand(3000, 0);
-        int count = lineIndex("onReceivedTestData() value: " + c.value);
-        int success = lineIndex("onSendCmdSuccess() command: 3000");
-        ASSERT_GE(count, 0) << c.value;
-        EXPECT_GT(success, count) << c.value;
+        sendBleTestCommand(c.code, c.code == 22440 ? 1 : 0);
+        EXPECT_EQ(takeJavaCalls(), c.java) << c.name;
+        if (!c.line.empty()) {
+            EXPECT_TRUE(log_.contains(ERROR, c.line)) << c.name << ": no line " << c.line;
+        }
+        EXPECT_EQ(cmd_test_end_flag, 0) << c.name;
     }
 }
 
@@ -97,92 +133,94 @@ TEST_F(TestModeTest, UnknownCodeSendsNothingAndReportsNothing) {
     EXPECT_EQ(log_.count(ERROR, "sendBleTestCommand, command not support return!!!"), 2);
     EXPECT_EQ(hal_->initializeCalls(), 0);
     EXPECT_TRUE(commandsSent(*hal_).empty());
-    EXPECT_EQ(successReports(), 0);
-    EXPECT_EQ(cmd_test_end_flag, 0);
+    EXPECT_EQ(takeJavaCalls(), "");
 }
 
 TEST_F(TestModeTest, NoSessionMeansNoCommandAndNoReport) {
     withoutController();
     sendBleTestCommand(12440, 0);
     EXPECT_TRUE(log_.contains(ERROR, "sendBleTestCommand, init smd error return!!!"));
-    EXPECT_EQ(successReports(), 0);
+    EXPECT_EQ(takeJavaCalls(), "");
     EXPECT_EQ(bt_fd, -1);
 }
 
-TEST_F(TestModeTest, UnansweredCommandIsNotReportedAsSuccess) {
-    answerWith([](const Bytes&) { return std::vector<Bytes>{}; });
-    sendBleTestCommand(12440, 1);
-    EXPECT_EQ(commandsSent(*hal_).size(), 1u);
-    EXPECT_EQ(successReports(), 0);
-    EXPECT_TRUE(log_.contains(ERROR, "sendBleTestCommand, command 12440 not answered return!!!"));
-}
-
-// A rejected test end leaves no pending count that the next command's reply
-// (here the Device Under Test entry's) could be mistaken for.
-TEST_F(TestModeTest, RejectedTestEndLeavesNoCountPending) {
-    answerWith([](const Bytes& command) {
-        uint16_t opcode = opcodeOf(command);
-        if (opcode == 0x201F) return std::vector<Bytes>{commandStatus(opcode, 0x0C)};
-        return std::vector<Bytes>{commandComplete(opcode)};
-    });
-    sendBleTestCommand(22440, 0);
-    sendBleTestCommand(3000, 0);
-    EXPECT_EQ(successReports(), 2);  // rejected, but written and answered
-    EXPECT_EQ(cmd_test_end_flag, 0);
-}
-
-TEST_F(TestModeTest, TestEndWithoutSessionSendsButCountIsNotPending) {
+// Opening a session clears the pending test end: a count from a session that
+// did not start the test is not reported.
+TEST_F(TestModeTest, TestEndThatOpensTheSessionReportsNoCount) {
     ASSERT_EQ(bt_fd, -1);
-    answerWith([this](const Bytes& command) {
-        // The opening cleared the flag before this command went out.
-        EXPECT_EQ(cmd_test_end_flag, 0);
+    answerWith([](const Bytes& command) {
         return std::vector<Bytes>{commandComplete(opcodeOf(command), {0x00, 0x2A, 0x00})};
     });
     sendBleTestCommand(3000, 0);
     EXPECT_EQ(commandsSent(*hal_).back(), (Bytes{0x1F, 0x20, 0x00}));
-    EXPECT_TRUE(log_.contains(INFO, "onSendCmdSuccess() command: 3000"));
+    EXPECT_EQ(takeJavaCalls(), "success 3000");
 }
+
+const std::vector<Bytes> kDutEntry = {
+        {0x03, 0x18, 0x00},
+        {0x05, 0x0C, 0x03, 0x02, 0x00, 0x02},
+        {0x1A, 0x0C, 0x01, 0x03},
+        {0x20, 0x0C, 0x01, 0x00},
+        {0x22, 0x0C, 0x01, 0x00},
+};
+const Bytes kReset = {0x03, 0x0C, 0x00};
 
 TEST_F(TestModeTest, DeviceUnderTestEntrySendsTheFiveCommandsInOrder) {
     EXPECT_EQ(hci_enable_device_under_test_mode(), 0);
-    const std::vector<Bytes> expected = {
-            {0x03, 0x18, 0x00},
-            {0x05, 0x0C, 0x03, 0x02, 0x00, 0x02},
-            {0x1A, 0x0C, 0x01, 0x03},
-            {0x20, 0x0C, 0x01, 0x00},
-            {0x22, 0x0C, 0x01, 0x00},
-    };
-    EXPECT_EQ(commandsSent(*hal_), expected);
+    EXPECT_EQ(commandsSent(*hal_), kDutEntry);
     int in = lineIndex("enterTestMode, hci_enable_device_under_test_mode IN.\n");
     int start = lineIndex("start send com to bt device!!!\n");
     int out = lineIndex("enterTestMode, hci_enable_device_under_test_mode OUT!!!\n");
     EXPECT_TRUE(in >= 0 && in < start && start < out);
     EXPECT_TRUE(log_.contains(ERROR, "start send com to bt device!!!\n"));
-    EXPECT_EQ(successReports(), 0);
+    EXPECT_EQ(takeJavaCalls(), "");
 }
 
-// Controllers reject the deprecated Write Encryption Mode with a Command
-// Status; no other event follows, so the entry must not wait for one.
-TEST_F(TestModeTest, DeviceUnderTestEntryDoesNotWaitAfterARejection) {
-    answerWith([](const Bytes& command) {
-        uint16_t opcode = opcodeOf(command);
-        if (opcode == 0x0C22) return std::vector<Bytes>{commandStatus(opcode, 0x01)};
-        return std::vector<Bytes>{commandComplete(opcode)};
-    });
-    auto start = std::chrono::steady_clock::now();
-    EXPECT_EQ(hci_enable_device_under_test_mode(), 0);
-    EXPECT_LT(msSince(start), 1500);
-}
-
-TEST_F(TestModeTest, DeviceUnderTestEntryFailsAndStopsWhenACommandIsNotAnswered) {
-    answerWith([](const Bytes& command) {
-        uint16_t opcode = opcodeOf(command);
-        if (opcode == 0x0C1A) return std::vector<Bytes>{};
-        return std::vector<Bytes>{commandComplete(opcode)};
-    });
-    EXPECT_EQ(hci_enable_device_under_test_mode(), -1);
-    EXPECT_EQ(commandsSent(*hal_).size(), 3u);
-    EXPECT_TRUE(log_.contains(ERROR, "enterTestMode, command ogf 0x3 ocf 0x1a not answered return!!!"));
+// Enable Device Under Test Mode, Set Event Filter and Write Scan Enable make
+// the mode; Write Authentication Enable and Write Encryption Mode only turn
+// off what is off by default, and many controllers refuse the latter.
+TEST_F(TestModeTest, DeviceUnderTestEntryIsAllOrNothing) {
+    const struct {
+        uint16_t opcode;
+        Bytes refusal;
+        bool entered;
+        std::string line;
+    } cases[] = {
+            {0x1803, commandComplete(0x1803, {0x01}), false,
+             "enterTestMode, command 0x1803 refused with status 0x01 return!!!"},
+            {0x0C05, commandComplete(0x0C05, {0x12}), false,
+             "enterTestMode, command 0x0c05 refused with status 0x12 return!!!"},
+            {0x0C1A, commandStatus(0x0C1A, 0x0C), false,
+             "enterTestMode, command 0x0c1a refused with status 0x0c return!!!"},
+            {0x0C20, commandComplete(0x0C20, {0x11}), true,
+             "enterTestMode, command 0x0c20 refused with status 0x11, not needed, going on"},
+            {0x0C22, commandStatus(0x0C22, 0x01), true,
+             "enterTestMode, command 0x0c22 refused with status 0x01, not needed, going on"},
+    };
+    for (const auto& c : cases) {
+        answerWith([&c](const Bytes& command) {
+            uint16_t opcode = opcodeOf(command);
+            return std::vector<Bytes>{opcode == c.opcode ? c.refusal : commandComplete(opcode)};
+        });
+        size_t before = commandsSent(*hal_).size();
+        int closes = hal_->closeCalls();
+        log_.clear();
+        EXPECT_EQ(hci_enable_device_under_test_mode(), c.entered ? 0 : -1) << c.line;
+        EXPECT_TRUE(log_.contains(c.entered ? INFO : ERROR, c.line)) << c.line;
+        std::vector<Bytes> sent = sentSince(before);
+        if (c.entered) {
+            EXPECT_EQ(sent, kDutEntry) << c.line;
+            EXPECT_GE(bt_fd, 0);
+            hci_disable_device_under_test_mode();
+            continue;
+        }
+        // Nothing after the refused command but a Reset, and no session left.
+        ASSERT_FALSE(sent.empty());
+        EXPECT_EQ(sent.back(), kReset) << c.line;
+        EXPECT_EQ(opcodeOf(sent[sent.size() - 2]), c.opcode) << c.line;
+        EXPECT_EQ(bt_fd, -1) << c.line;
+        EXPECT_EQ(hal_->closeCalls(), closes + 1) << c.line;
+    }
 }
 
 TEST_F(TestModeTest, DeviceUnderTestEntryWithoutControllerFails) {
@@ -196,7 +234,7 @@ TEST_F(TestModeTest, DeviceUnderTestExitSendsResetAndEndsTheSession) {
     int fds = countOpenFds();
     sendBleTestCommand(22402, 0);
     EXPECT_EQ(hci_disable_device_under_test_mode(), 0);
-    EXPECT_EQ(commandsSent(*hal_).back(), (Bytes{0x03, 0x0C, 0x00}));
+    EXPECT_EQ(commandsSent(*hal_).back(), kReset);
     EXPECT_EQ(bt_fd, -1);
     EXPECT_EQ(client_fd, -1);
     EXPECT_EQ(hal_->closeCalls(), 1);
@@ -221,6 +259,10 @@ TEST_F(TestModeTest, DeviceUnderTestExitWithoutSessionStillReturnsZero) {
 }
 
 TEST_F(TestModeTest, ContinuousWaveCommandCarriesChannelPowerAndType) {
+    answerWith([](const Bytes& command) {
+        uint8_t status = command[4] == 0xFF ? 0x12 : 0x00;  // a vendor refusing channel 255
+        return std::vector<Bytes>{commandComplete(opcodeOf(command), {status})};
+    });
     sendCwtxCommandNative(nullptr, nullptr, 1, 9, 4);
     sendCwtxCommandNative(nullptr, nullptr, 255, 0, 255);
     std::vector<Bytes> expected = {
@@ -229,8 +271,8 @@ TEST_F(TestModeTest, ContinuousWaveCommandCarriesChannelPowerAndType) {
     };
     EXPECT_EQ(commandsSent(*hal_), expected);
     EXPECT_TRUE(log_.contains(INFO, "sendCwtxCommandNative channel= 1, power= 9, type= 4"));
-    EXPECT_TRUE(log_.contains(INFO, "init bt_fd successful"));
-    EXPECT_EQ(successReports(), 0);
+    EXPECT_EQ(log_.count(ERROR, "sendCwtxCommandNative, command 0xfc04 refused with status 0x12 return!!!"), 1);
+    EXPECT_EQ(takeJavaCalls(), "");
 }
 
 TEST_F(TestModeTest, ContinuousWaveValuesOutsideAByteSendNothing) {
@@ -239,6 +281,53 @@ TEST_F(TestModeTest, ContinuousWaveValuesOutsideAByteSendNothing) {
     EXPECT_EQ(log_.count(ERROR, "sendCwtxCommandNative, channel, power and type must be 0 to 255 return!!!"), 4);
     EXPECT_EQ(hal_->initializeCalls(), 0);
     EXPECT_TRUE(commandsSent(*hal_).empty());
+}
+
+// A HAL process can die at any call. The step that meets it fails with its
+// line, the process goes on (an unchecked failed call would abort it), and
+// the next procedure opens a session on the HAL that took its place.
+TEST_F(TestModeTest, HalDyingAtAnyCallFailsOnlyThatStep) {
+    const struct {
+        FakeHal::Call call;
+        const char* line;
+    } cases[] = {
+            {FakeHal::Call::LinkToDeath, "hidl_client_initialize: the HAL died before initialize: "},
+            {FakeHal::Call::Initialize, "hidl_client_initialize: initialize failed: "},
+            {FakeHal::Call::Send, "serviceDied: the Bluetooth HAL died"},
+            {FakeHal::Call::Close, "hidl_client_close: HIDL daemon is dead"},
+    };
+    for (const auto& c : cases) {
+        android::sp<FakeHal> dying = new FakeHal();
+        dying->onSend = hal_->onSend;
+        dying->dieAt(c.call);
+        dying->registerDefault();
+        log_.clear();
+        sendBleTestCommand(22440, 1);
+        hci_disable_device_under_test_mode();
+        EXPECT_TRUE(log_.containsFragment(c.line)) << c.line;
+        EXPECT_EQ(takeJavaCalls(), c.call == FakeHal::Call::Close ? "success 22440" : "") << c.line;
+
+        hal_->registerDefault();
+        sendBleTestCommand(22440, 1);
+        EXPECT_EQ(takeJavaCalls(), "success 22440") << c.line;
+        hci_disable_device_under_test_mode();
+    }
+}
+
+// A HAL that dies while a session is open is noticed at the next procedure,
+// which opens a new session instead of failing.
+TEST_F(TestModeTest, DeathBetweenProceduresIsFollowedByANewSession) {
+    android::sp<FakeHal> first = hal_;
+    sendBleTestCommand(22440, 1);
+    ASSERT_EQ(takeJavaCalls(), "success 22440");
+    hal_ = new FakeHal();
+    hal_->onSend = first->onSend;
+    hal_->registerDefault();
+    first->die();
+    sendBleTestCommand(3000, 0);
+    EXPECT_TRUE(log_.contains(ERROR, "sendBleTestCommand: the controller session had ended, opening a new one"));
+    EXPECT_EQ(takeJavaCalls(), "success 3000");
+    EXPECT_EQ(hal_->initializeCalls(), 1);
 }
 
 }  // namespace

@@ -220,7 +220,7 @@ void initNeverAnswered(FaultInjectionTest& t) {
 
 void closeReportsDead(FaultInjectionTest& t, bool by_destroy) {
     sp<FakeHal> hal = t.installAnsweringHal();
-    hal->closeReportsDead = true;
+    hal->dieAt(FakeHal::Call::Close);
     EXPECT_EQ(0, hci_enable_device_under_test_mode());
     if (by_destroy) destoryNative(nullptr, nullptr);
     else hci_disable_device_under_test_mode();
@@ -267,14 +267,11 @@ void answersLate(FaultInjectionTest& t) {
 void commandStatusErrors(FaultInjectionTest& t) {
     sp<FakeHal> hal = t.installHal();
     hal->onSend = [](FakeHal& h, const SentPacket& p) { h.deliverEvent(commandStatus(opcodeOf(p), 0x0C)); };
-    hci_enable_device_under_test_mode();
+    EXPECT_EQ(-1, hci_enable_device_under_test_mode());
     sendBleTestCommand(3000, 0);
     EXPECT_EQ(0, t.log.count(ANDROID_LOG_INFO, "onReceivedTestData() value: 42"));
     hci_disable_device_under_test_mode();
-    std::vector<Bytes> want = kDutEntry;
-    want.push_back(kTestEnd);
-    want.push_back(kReset);
-    FaultInjectionTest::expectSent(*hal, want);
+    FaultInjectionTest::expectSent(*hal, {kDutEntry[0], kReset, kTestEnd, kReset});
 }
 
 // Every command is first answered for the opcode before it.
@@ -375,6 +372,42 @@ void destroyDuringExchange(FaultInjectionTest& t) {
     FaultInjectionTest::expectSent(*hal, {kTestEnd});
 }
 
+// Events the controller sends on its own, every 100 ms, and never the reply:
+// they must not keep the exchange waiting past its time-out.
+void unsolicitedEventsNoReply(FaultInjectionTest& t) {
+    sp<FakeHal> hal = t.installHal();
+    auto done = std::make_shared<std::atomic<bool>>(false);
+    t.spawn([hal, done] {
+        hal->waitForSent(1);
+        for (int i = 0; i < 50 && !*done; ++i) {
+            hal->deliverEvent({0x3E, 0x03, 0x01, 0x2A, 0x00});
+            std::this_thread::sleep_for(std::chrono::milliseconds(100));
+        }
+    });
+    sendBleTestCommand(3000, 0);
+    *done = true;
+    EXPECT_FALSE(t.log.contains(ANDROID_LOG_INFO, "onSendCmdSuccess() command: 3000"));
+    destoryNative(nullptr, nullptr);
+    t.joinSpawned();
+}
+
+// A HAL that gives no death notice dies at the send: the pump's end alone
+// must end the exchange at once.
+class NoticelessHal : public FakeHal {
+  public:
+    Return<bool> linkToDeath(const sp<android::hardware::hidl_death_recipient>&, uint64_t) override {
+        return false;
+    }
+};
+
+void diesWithoutNotice(FaultInjectionTest&) {
+    sp<FakeHal> hal = new NoticelessHal();
+    hal->dieAt(FakeHal::Call::Send);
+    hal->registerDefault();
+    sendBleTestCommand(22440, 0);
+    hci_disable_device_under_test_mode();
+}
+
 const FaultCase kFaults[] = {
         {"no_hal_service", 1000, ANDROID_LOG_ERROR, "Unable to initialize the HIDL", noHalService},
         {"init_fails_on_calling_thread", 1000, ANDROID_LOG_ERROR,
@@ -387,16 +420,14 @@ const FaultCase kFaults[] = {
          "initializationComplete: answer to an abandoned opening ignored", initAnsweredTwice},
         {"init_never_answered", 12000, ANDROID_LOG_ERROR,
          "hidl_client_initialize: no answer from the HAL within 10000 ms", initNeverAnswered},
-        {"close_reports_dead_on_quit", 1000, ANDROID_LOG_INFO, "hidl_client_close: HIDL daemon is dead",
-         [](FaultInjectionTest& t) { closeReportsDead(t, false); }},
         {"close_reports_dead_on_destroy", 1000, ANDROID_LOG_INFO, "destoryNative: HIDL daemon is dead",
          [](FaultInjectionTest& t) { closeReportsDead(t, true); }},
         {"controller_never_answers", 3000, ANDROID_LOG_ERROR,
          "read_incoming_events: timed out after 2000 ms waiting for the packet type, return -1", neverAnswers},
         {"controller_answers_late", 4500, ANDROID_LOG_INFO,
-         "hci_cmd: dropped 7 stale bytes before the command", answersLate},
-        {"command_status_errors", 1000, ANDROID_LOG_INFO, "read_incoming_events: command rejected with status 0xc",
-         commandStatusErrors},
+         "cmd_rawcmd: dropped 7 stale bytes before the command", answersLate},
+        {"command_status_errors", 1000, ANDROID_LOG_ERROR,
+         "sendBleTestCommand, command 3000 (opcode 0x201f) refused with status 0x0c return!!!", commandStatusErrors},
         {"complete_for_another_opcode", 1000, ANDROID_LOG_INFO,
          "read_incoming_events: event 0xe does not answer opcode 0x201f, skipped", completeForAnotherOpcode},
         {"acl_where_event_expected", 1000, ANDROID_LOG_ERROR, "sendBleTestCommand, command 3000 not answered return!!!",
@@ -408,6 +439,11 @@ const FaultCase kFaults[] = {
         {"controller_closes_mid_packet", 1000, ANDROID_LOG_INFO, "read error :size = 6\n", controllerClosesMidPacket},
         {"tool_end_closed_mid_packet", 1000, ANDROID_LOG_ERROR, "process_tool_data: failed to read the packet from tool",
          toolEndClosedMidPacket},
+        {"unsolicited_events_no_reply", 3500, ANDROID_LOG_ERROR,
+         "read_incoming_events: timed out after 2000 ms waiting for the packet type, return -1",
+         unsolicitedEventsNoReply},
+        {"hal_dies_without_notice", 1000, ANDROID_LOG_ERROR, "sendBleTestCommand, command 22440 not answered return!!!",
+         diesWithoutNotice},
         {"destroy_during_exchange", 1000, ANDROID_LOG_ERROR, "sendBleTestCommand, command 3000 not answered return!!!",
          destroyDuringExchange},
 };

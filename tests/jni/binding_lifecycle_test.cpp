@@ -58,14 +58,6 @@ TEST_F(BindingLifecycleTest, DestroyEndsTheSessionAndLaterClosesCloseNothingTwic
     EXPECT_EQ(commandsSent(*hal_).size(), 2u);
 }
 
-TEST_F(BindingLifecycleTest, DeadHalIsReportedAndReleasedAllTheSame) {
-    hal_->closeReportsDead = true;
-    sendBleTestCommand(12402, 0);
-    destoryNative(nullptr, nullptr);
-    EXPECT_TRUE(log_.contains(INFO, "destoryNative: HIDL daemon is dead"));
-    EXPECT_EQ(btHci, nullptr);
-}
-
 // Many sessions, each destroyed while commands written to the tool end are
 // still being forwarded and a HAL thread keeps delivering events; nothing may
 // reach a closed HAL, and no descriptor or thread may be left behind.

@@ -83,15 +83,15 @@ TEST_F(ByteValuesTest, BinaryParametersAndOpcodeKeepTheirValueOnTheWayOut) {
 
 TEST_F(ByteValuesTest, TokenParametersKeepTheirValueOnTheWayOut) {
     const char* tokens[] = {"rawcmd", "0x3F", "0x03FF", "0x80", "0xff", "0xFE", "0x7F"};
-    ASSERT_EQ(0, cmd_rawcmd(bt_fd, 7, tokens));
+    ASSERT_EQ(0, cmd_rawcmd(bt_fd, 7, tokens).status);
     ASSERT_TRUE(hal_->waitForSent(1));
     EXPECT_EQ((Bytes{0xFF, 0xFF, 0x04, 0x80, 0xFF, 0xFE, 0x7F}), hal_->sent()[0].bytes);
     EXPECT_TRUE(log_.contains(ANDROID_LOG_INFO, "0xfe "));
     EXPECT_FALSE(loggedSignExtension());
 }
 
-// The reply is the longest event there is (255 parameter bytes), ending with
-// the count that goes to Java.
+// The reply is the longest event there is (255 parameter bytes): LE Test
+// End's status and the count that goes to Java, then bytes of 0x80 and up.
 TEST_F(ByteValuesTest, CountsInTheLongestEventComeBackUnsigned) {
     const struct {
         uint8_t low, high;
@@ -100,8 +100,8 @@ TEST_F(ByteValuesTest, CountsInTheLongestEventComeBackUnsigned) {
     const char* tokens[] = {"rawcmd", "0x08", "0x001F"};
     for (const auto& c : cases) {
         log_.clear();
-        answerWith(concat(run(0x80, 250), {c.low, c.high}));
-        ASSERT_EQ(0, cmd_rawcmd(bt_fd, 3, tokens)) << c.value;
+        answerWith(concat({0x00, c.low, c.high}, run(0x80, 249)));
+        ASSERT_EQ(0, cmd_rawcmd(bt_fd, 3, tokens).status) << c.value;
         EXPECT_TRUE(log_.contains(ANDROID_LOG_INFO, std::string("onReceivedTestData() value: ") + c.value));
         EXPECT_TRUE(log_.contains(ANDROID_LOG_INFO, "[ff]")) << "the event's length byte";
         EXPECT_FALSE(loggedSignExtension()) << c.value;

@@ -102,12 +102,14 @@ TEST_F(SessionTest, FailedInitialisationFromEitherThreadFailsTheOpening) {
         EXPECT_TRUE(log.contains(ANDROID_LOG_ERROR, "Error in HIDL initialization"));
         EXPECT_TRUE(log.contains(ANDROID_LOG_ERROR,
                                  "hidl_client_initialize: HIDL failed to initialize, sending invalid FD to tool"));
+        // The initialised HAL was closed and given back: nothing is left to end.
+        EXPECT_EQ(1, hal->closeCalls());
+        EXPECT_EQ(nullptr, btHci.get());
 
         log.clear();
         hidl_client_close();
         EXPECT_TRUE(log.contains(ANDROID_LOG_INFO, "hidl_client_close: Hidl init = false"));
         EXPECT_EQ(1u, log.lines().size());
-        hidl_client_release_service("test");
     }
 }
 
@@ -127,6 +129,8 @@ TEST_F(SessionTest, UnansweredInitialisationTimesOutAndItsLateAnswerIsIgnored) {
     EXPECT_EQ(-1, bt_fd);
     EXPECT_LT(waited, std::chrono::seconds(30));
     EXPECT_TRUE(log.contains(ANDROID_LOG_ERROR, "hidl_client_initialize: no answer from the HAL within 10000 ms"));
+    EXPECT_EQ(1, silent->closeCalls());
+    EXPECT_EQ(nullptr, btHci.get());
     sp<FakeHal::Callbacks> stale = silent->callbacks();
 
     sp<FakeHal> next = installHal(FakeHal::InitMode::Never);
@@ -251,15 +255,6 @@ TEST_F(SessionTest, CloseJoinsThePumpAndReleasesTheService) {
     // A second close has no pump to join and no service to close.
     hidl_client_close();
     EXPECT_EQ(1, hal->closeCalls());
-}
-
-TEST_F(SessionTest, DeadServiceAtCloseIsLoggedAndReleased) {
-    sp<FakeHal> hal = installHal();
-    hal->closeReportsDead = true;
-    hidl_client_init();
-    hidl_client_close();
-    EXPECT_TRUE(log.contains(ANDROID_LOG_INFO, "hidl_client_close: HIDL daemon is dead"));
-    EXPECT_EQ(nullptr, btHci.get());
 }
 
 // Closing while the engine is still writing: the pump is joined before the
