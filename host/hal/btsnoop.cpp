@@ -57,27 +57,42 @@ static bool write_header_if_new(int fd) {
     return ok;
 }
 
-std::shared_ptr<Btsnoop> Btsnoop::open(const std::string& path) {
+// A descriptor ready to append records to, or -1 (logged).
+int Btsnoop::openFile(const std::string& path) {
     int fd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
     if (fd == -1) {
         HLOGE("btsnoop: cannot open %s: %s", path.c_str(), strerror(errno));
-        return nullptr;
+        return -1;
     }
     if (!write_header_if_new(fd)) {
         HLOGE("btsnoop: cannot write the header of %s: %s", path.c_str(), strerror(errno));
         close(fd);
-        return nullptr;
+        return -1;
     }
-    return std::shared_ptr<Btsnoop>(new Btsnoop(fd));
+    return fd;
+}
+
+std::shared_ptr<Btsnoop> Btsnoop::open(const std::string& path) {
+    int fd = openFile(path);
+    if (fd == -1) return nullptr;
+    return std::shared_ptr<Btsnoop>(new Btsnoop({fd}));
 }
 
 std::shared_ptr<Btsnoop> Btsnoop::fromEnvironment() {
-    const char* path = getenv("HALVENOR_BTSNOOP");
-    if (path == nullptr || path[0] == '\0') return nullptr;
-    return open(path);
+    std::vector<int> fds;
+    for (const char* name : {"HALVENOR_BTSNOOP", "HALVENOR_CONSOLE_CAPTURE"}) {
+        const char* path = getenv(name);
+        if (path == nullptr || path[0] == '\0') continue;
+        int fd = openFile(path);
+        if (fd != -1) fds.push_back(fd);
+    }
+    if (fds.empty()) return nullptr;
+    return std::shared_ptr<Btsnoop>(new Btsnoop(std::move(fds)));
 }
 
-Btsnoop::~Btsnoop() { close(fd_); }
+Btsnoop::~Btsnoop() {
+    for (int fd : fds_) close(fd);
+}
 
 void Btsnoop::record(uint8_t type, const uint8_t* packet, size_t len, bool received) {
     struct timeval tv;
@@ -98,5 +113,7 @@ void Btsnoop::record(uint8_t type, const uint8_t* packet, size_t len, bool recei
     rec.insert(rec.end(), packet, packet + len);
 
     std::lock_guard<std::mutex> guard(lock_);
-    if (!write_all(fd_, rec)) HLOGE("btsnoop: write failed: %s", strerror(errno));
+    for (int fd : fds_) {
+        if (!write_all(fd, rec)) HLOGE("btsnoop: write failed: %s", strerror(errno));
+    }
 }

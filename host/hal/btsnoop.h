@@ -8,11 +8,14 @@
 #include <memory>
 #include <mutex>
 #include <string>
+#include <vector>
 
 class Btsnoop {
   public:
-    // The capture named by HALVENOR_BTSNOOP, or null when it is unset or the
-    // file cannot be opened (logged).
+    // The captures named by HALVENOR_BTSNOOP (the user's) and
+    // HALVENOR_CONSOLE_CAPTURE (the console's own, where it reads the
+    // controller's answers), or null when neither is set or none can be
+    // opened (logged).
     static std::shared_ptr<Btsnoop> fromEnvironment();
     // Appends to path, writing the file header first when the file is new or empty.
     static std::shared_ptr<Btsnoop> open(const std::string& path);
@@ -22,7 +25,8 @@ class Btsnoop {
     void record(uint8_t type, const uint8_t* packet, size_t len, bool received);
 
   private:
-    explicit Btsnoop(int fd) : fd_(fd) {}
-    int fd_;
+    explicit Btsnoop(std::vector<int> fds) : fds_(std::move(fds)) {}
+    static int openFile(const std::string& path);
+    std::vector<int> fds_;
     std::mutex lock_;
 };

@@ -61,17 +61,26 @@ static long parse_number(const std::string& text, long max) {
     return n >= 1 && n <= max ? n : -1;
 }
 
+// "DEVICE[,BAUD][,rtscts]": many UART boards need RTS/CTS to keep up.
 static bool parse_tty(const std::string& rest, H4Target* t, std::string* why) {
     size_t comma = rest.find(',');
     t->path = rest.substr(0, comma);
     if (t->path.empty()) return *why = "no device after tty:", false;
-    if (comma == std::string::npos) return true;
-    long baud = parse_number(rest.substr(comma + 1), 4000000);
-    speed_t speed;
-    if (baud < 0 || !baud_speed(static_cast<int>(baud), &speed)) {
-        return *why = "baud rate '" + rest.substr(comma + 1) + "' is not a standard serial speed", false;
+    while (comma != std::string::npos) {
+        size_t next = rest.find(',', comma + 1);
+        std::string field = rest.substr(comma + 1, next == std::string::npos ? std::string::npos : next - comma - 1);
+        comma = next;
+        if (field == "rtscts") {
+            t->rtscts = true;
+            continue;
+        }
+        long baud = parse_number(field, 4000000);
+        speed_t speed;
+        if (baud < 0 || !baud_speed(static_cast<int>(baud), &speed)) {
+            return *why = "baud rate " + field + " is not a standard speed (9600 to 4000000)", false;
+        }
+        t->baud = static_cast<int>(baud);
     }
-    t->baud = static_cast<int>(baud);
     return true;
 }
 
@@ -105,7 +114,7 @@ bool parse_h4_target(const std::string& value, H4Target* t, std::string* why) {
         t->kind = H4Target::TTY;
         return parse_tty(rest, t, why);
     }
-    *why = "expected sim, none, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD]";
+    *why = "expected sim, none, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]";
     return false;
 }
 
@@ -174,7 +183,7 @@ static int connect_tcp(const H4Target& t, int wake, std::string* why) {
     return fd;
 }
 
-// Raw 8N1, no flow control, the requested speed.
+// Raw 8N1 at the requested speed, with RTS/CTS only when asked for.
 static int open_tty(const H4Target& t, std::string* why) {
     int fd = open(t.path.c_str(), O_RDWR | O_NOCTTY | O_NONBLOCK | O_CLOEXEC);
     if (fd == -1) return *why = std::string("open: ") + strerror(errno), -1;
@@ -182,13 +191,14 @@ static int open_tty(const H4Target& t, std::string* why) {
     speed_t speed = B115200;
     baud_speed(t.baud, &speed);
     if (tcgetattr(fd, &tio) == -1) {
-        *why = std::string("not a serial line: ") + strerror(errno);
+        *why = errno == ENOTTY ? std::string("not a serial line") : std::string("tcgetattr: ") + strerror(errno);
         close(fd);
         return -1;
     }
     cfmakeraw(&tio);
     tio.c_cflag |= CLOCAL | CREAD;
-    tio.c_cflag &= ~CRTSCTS;
+    if (t.rtscts) tio.c_cflag |= CRTSCTS;
+    else tio.c_cflag &= ~CRTSCTS;
     cfsetispeed(&tio, speed);
     cfsetospeed(&tio, speed);
     if (tcsetattr(fd, TCSANOW, &tio) == -1) {
@@ -277,11 +287,14 @@ void H4Hci::readerMain() {
     readLoop(fd);
 }
 
-// Ends the session on the controller's side; later sends are dropped.
+// The controller is gone: the session ends on its side and the service dies.
 void H4Hci::endSession(int fd) {
-    std::lock_guard<std::mutex> guard(lock_);
-    connected_ = false;
-    if (isSocket()) shutdown(fd, SHUT_RDWR);
+    {
+        std::lock_guard<std::mutex> guard(lock_);
+        connected_ = false;
+        if (isSocket()) shutdown(fd, SHUT_RDWR);
+    }
+    die();
 }
 
 void H4Hci::readLoop(int fd) {
@@ -294,13 +307,17 @@ void H4Hci::readLoop(int fd) {
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0 && closing_.load()) return;
         if (n <= 0) {
-            HLOGE("h4: lost connection to %s: %s%s", target_.text.c_str(),
-                  n == 0 ? "end of stream" : strerror(errno), stream.pending() ? " (mid-packet)" : "");
+            if (n == 0) {
+                HLOGE("h4: %s: controller closed the connection%s", target_.text.c_str(),
+                      stream.pending() ? " in the middle of a packet" : "");
+            } else {
+                HLOGE("h4: %s: connection lost: %s", target_.text.c_str(), strerror(errno));
+            }
             return endSession(fd);
         }
         if (!stream.feed(buf, static_cast<size_t>(n), sink)) {
-            HLOGE("h4: unknown packet type 0x%02x from %s, session ended", stream.badType(),
-                  target_.text.c_str());
+            HLOGE("h4: %s: controller sent unknown packet type 0x%02x, connection closed",
+                  target_.text.c_str(), stream.badType());
             return endSession(fd);
         }
     }
@@ -329,6 +346,7 @@ Return<void> H4Hci::send(uint8_t type, const hidl_vec<uint8_t>& packet) {
     std::shared_ptr<Btsnoop> snoop;
     {
         std::lock_guard<std::mutex> guard(lock_);
+        if (hasDied()) return deadObject();
         if (!connected_) {
             if (!drop_logged_) HLOGE("h4: not connected to %s, packets dropped", target_.text.c_str());
             drop_logged_ = true;
@@ -341,10 +359,9 @@ Return<void> H4Hci::send(uint8_t type, const hidl_vec<uint8_t>& packet) {
     // captured, before a write returns.
     if (snoop) snoop->record(type, packet.data(), packet.size(), false);
     if (!h4_send(fd, isSocket(), type, packet.data(), packet.size())) {
-        HLOGE("h4: write to %s: %s", target_.text.c_str(), strerror(errno));
-        std::lock_guard<std::mutex> guard(lock_);
-        connected_ = false;
-        drop_logged_ = true;
+        HLOGE("h4: %s: connection lost: %s", target_.text.c_str(), strerror(errno));
+        endSession(fd);
+        return deadObject();
     }
     return Void();
 }

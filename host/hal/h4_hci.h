@@ -13,9 +13,10 @@ struct H4Target {
     std::string path;  // socket path, host name or device
     int port = 0;
     int baud = 115200;
+    bool rtscts = false;  // hardware flow control on a serial line
 };
 
-// Parses "unix:PATH", "tcp:HOST:PORT" or "tty:DEVICE[,BAUD]". On failure
+// Parses "unix:PATH", "tcp:HOST:PORT" or "tty:DEVICE[,BAUD][,rtscts]". On failure
 // returns false with the reason in *why.
 bool parse_h4_target(const std::string& value, H4Target* target, std::string* why);
 

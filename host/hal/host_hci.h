@@ -3,6 +3,7 @@
 // the service's own stop. Runs on the library's calling thread.
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 
 #include <android/hardware/bluetooth/1.0/IBluetoothHci.h>
@@ -26,12 +27,26 @@ class HostHci : public IBluetoothHci {
     Return<void> sendScoData(const hidl_vec<uint8_t>& p) final { return send(H4_SCO, p); }
     Return<void> close() final {
         stop();
+        if (died_.load()) return deadObject();
         return Void();
     }
 
   protected:
+    // A HAL whose controller is gone dies, as a device's HAL process does:
+    // its clients are told, and every later call fails.
+    void die() {
+        if (!died_.exchange(true)) notifyServiceDied();
+    }
+    bool hasDied() const { return died_.load(); }
+    static android::hardware::Status deadObject() {
+        return android::hardware::Status::fromExceptionCode(android::hardware::Status::EX_TRANSACTION_FAILED);
+    }
+
     // One packet from the library; `type` is its H4 packet type.
     virtual Return<void> send(uint8_t type, const hidl_vec<uint8_t>& packet) = 0;
     // Ends the session, if one runs; a service calls it again freely.
     virtual void stop() = 0;
+
+  private:
+    std::atomic<bool> died_{false};
 };

@@ -52,7 +52,7 @@ const BadSetting kBadSettings[] = {
         {"HALVENOR_HCI", "tcp:127.0.0.1:70000", "port '70000' is not in 1..65535"},
         {"HALVENOR_HCI", "tcp:127.0.0.1:x1", "port 'x1'"},
         {"HALVENOR_HCI", "tty:", "no device after tty:"},
-        {"HALVENOR_HCI", "tty:/dev/ttyS0,12345", "baud rate '12345' is not a standard serial speed"},
+        {"HALVENOR_HCI", "tty:/dev/ttyS0,12345", "baud rate 12345 is not a standard speed"},
         {"HALVENOR_SIM_LOSS", "2", "expected a fraction from 0 to 1"},
         {"HALVENOR_SIM_LOSS", "lots", "expected a fraction from 0 to 1"},
         {"HALVENOR_SIM_REFTX", "yes", "expected 0 or 1"},

@@ -53,7 +53,12 @@ class return_status {
         return mStatus.isOk();
     }
     bool isOkUnchecked() const { return mStatus.isOk(); }
-    bool isDeadObject() const { return mStatus.exceptionCode() == Status::EX_TRANSACTION_FAILED; }
+    // Answering true is a check of the status too; false leaves isOk() to be asked.
+    bool isDeadObject() const {
+        bool dead = mStatus.exceptionCode() == Status::EX_TRANSACTION_FAILED;
+        if (dead) mCheckedStatus = true;
+        return dead;
+    }
     std::string description() const { return mStatus.description(); }
 
   protected:

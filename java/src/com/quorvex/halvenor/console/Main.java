@@ -2,9 +2,13 @@
 // controller the launcher chose, with results as a table or JSON.
 package com.quorvex.halvenor.console;
 
+import java.io.IOException;
 import java.io.PrintStream;
-import java.util.ArrayList;
-import java.util.List;
+import java.nio.file.Files;
+import java.nio.file.Path;
+import java.util.Comparator;
+import java.util.Map;
+import java.util.stream.Stream;
 
 public final class Main {
     static final int EXIT_OK = 0;
@@ -15,36 +19,47 @@ public final class Main {
     private Main() {}
 
     public static void main(String[] args) {
-        System.exit(run(args, System.out, System.err));
+        int status = run(args, System.out, System.err);
+        removeScratch();
+        System.exit(status);
     }
 
     static int run(String[] args, PrintStream out, PrintStream err) {
         Options o;
+        Map<String, String> env = System.getenv();
         try {
             o = Options.parse(args);
-            o.checkEnvironment(System.getenv());
+            if (!o.command.equals("help")) {
+                o.checkEnvironment(env);
+            }
         } catch (UsageException e) {
             err.println("halvenor: " + e.getMessage());
             err.println("halvenor: run './halvenor help' for the commands and options");
             return EXIT_USAGE;
         }
         if (o.command.equals("help")) {
-            out.print(Usage.TEXT);
+            out.print(Usage.text(o.helpFor));
             return EXIT_OK;
         }
+        Path capture = Path.of(env.get("HALVENOR_CONSOLE_CAPTURE"));
+        Observer observer = new Observer(capture, Path.of(env.get("HALVENOR_LOG_FILE")));
         Bench bench;
         try {
-            bench = new Bench();
+            bench = new Bench(observer);
         } catch (UnsatisfiedLinkError | NoClassDefFoundError e) {
             err.println("halvenor: cannot load libhalvenor.so (" + e + "); java.library.path="
                         + System.getProperty("java.library.path"));
             return EXIT_FAILED;
         }
-        Thread hook = new Thread(() -> interrupted(bench, err), "halvenor-interrupt");
+        Trace trace = o.trace ? Trace.start(capture, err) : null;
+        Progress progress = Progress.forConsole(out);
+        Report report = new Report(out, o, progress);
+        Runner runner = new Runner(bench, observer, progress);
+        report.start();
+        Thread hook = new Thread(() -> interrupted(bench, runner, report, trace, err), "halvenor-interrupt");
         Runtime.getRuntime().addShutdownHook(hook);
-        List<Step> steps = new ArrayList<>();
         try {
-            perform(o, new Runner(bench, Progress.forConsole(out)), steps);
+            perform(o, runner, report, trace);
         } catch (Bench.Closed e) {
             parkUntilExit();
         }
@@ -54,33 +69,37 @@ public final class Main {
         } catch (IllegalStateException e) {
             parkUntilExit();
         }
-        if (o.json) {
-            Report.json(out, o, steps);
-        } else {
-            Report.table(out, o, steps);
+        if (trace != null) {
+            trace.stop();
         }
-        out.flush();
-        return steps.stream().allMatch(s -> s.ok) ? EXIT_OK : EXIT_FAILED;
+        report.finish(null, null);
+        return report.ok() ? EXIT_OK : EXIT_FAILED;
     }
 
-    // Stops at the first failed step: later ones would only meet the same controller.
-    private static void perform(Options o, Runner r, List<Step> steps) {
+    // A failed step does not stop the run: a sweep goes on to its next setting. Only a
+    // controller that nothing reaches ends it, as every later step would meet the same.
+    private static void perform(Options o, Runner r, Report report, Trace trace) {
         for (Plan.Item item : Plan.of(o)) {
-            Step s = item.run(r);
-            steps.add(s);
-            if (!s.ok) {
+            Step s = r.run(item);
+            if (trace != null) {
+                trace.flush();
+            }
+            report.add(s);
+            if (!s.ok && s.unreachable) {
                 return;
             }
         }
     }
 
     /**
-     * Runs in the shutdown hook. A controller that stopped answering keeps the native call
-     * in progress, and so the bench, busy; the exit then goes ahead after a bound rather
+     * Runs in the shutdown hook: ends what the controller is doing, then prints the finished
+     * steps and the interrupted one. A controller that stopped answering keeps the native
+     * call in progress, and so the bench, busy; the exit then goes ahead after a bound rather
      * than hanging on Ctrl-C.
      */
-    private static void interrupted(Bench bench, PrintStream err) {
+    private static void interrupted(Bench bench, Runner runner, Report report, Trace trace, PrintStream err) {
         String[] done = new String[1];
+        Step current = runner.current();
         Thread stopper = new Thread(() -> done[0] = bench.interrupt(), "halvenor-stop");
         stopper.setDaemon(true);
         stopper.start();
@@ -89,13 +108,31 @@ public final class Main {
         } catch (InterruptedException e) {
             Thread.currentThread().interrupt();
         }
-        if (stopper.isAlive()) {
-            err.println("halvenor: interrupted: the controller did not answer within "
-                        + INTERRUPT_BOUND_MS / 1000 + " s; it may still be running a test");
-        } else if (done[0] != null) {
-            err.println("halvenor: interrupted: " + done[0] + " before exiting");
+        String what = stopper.isAlive()
+                ? "the controller did not answer within " + INTERRUPT_BOUND_MS / 1000 + " s; it may still be running a test"
+                : done[0];
+        if (trace != null) {
+            trace.stop();
+        }
+        report.finish(current, what);
+        if (what != null) {
+            err.println("halvenor: interrupted: " + what + (stopper.isAlive() ? "" : " before exiting"));
         }
         err.flush();
+        removeScratch();
+    }
+
+    // The launcher's scratch directory: the console's own capture and log.
+    private static void removeScratch() {
+        String dir = System.getProperty("halvenor.scratch");
+        if (dir == null) {
+            return;
+        }
+        try (Stream<Path> files = Files.walk(Path.of(dir))) {
+            files.sorted(Comparator.reverseOrder()).forEach(p -> p.toFile().delete());
+        } catch (IOException e) {
+            // a scratch directory left in the temporary folder harms nobody
+        }
     }
 
     // The shutdown hook owns the controller now; the JVM halts once it is done.

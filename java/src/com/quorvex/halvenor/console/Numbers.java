@@ -4,8 +4,8 @@ package com.quorvex.halvenor.console;
 final class Numbers {
     private Numbers() {}
 
-    /** Seconds as "1.5", "1.5s" or "500ms"; more than 0 and at most {@code max}. */
-    static double seconds(String option, String text, double max) throws UsageException {
+    /** Seconds as "1.5", "1.5s" or "500ms": more than 0 (or at least {@code min} when set) and at most {@code max}. */
+    static double seconds(String option, String text, double min, double max) throws UsageException {
         String t = text.trim().toLowerCase();
         double scale = 1;
         if (t.endsWith("ms")) {
@@ -20,8 +20,10 @@ final class Numbers {
         } catch (NumberFormatException e) {
             v = Double.NaN;
         }
-        if (!(v > 0 && v <= max)) {
-            throw new UsageException("bad " + option + " '" + text + "': give seconds, more than 0 and at most "
+        boolean low = min > 0 ? v >= min : v > 0;
+        if (!(low && v <= max)) {
+            String from = min > 0 ? "at least " + fmt(min) : "more than 0";
+            throw new UsageException("bad " + option + " '" + text + "': give seconds, " + from + " and at most "
                                      + fmt(max) + " (for example 2, 0.5 or 500ms)");
         }
         return v;

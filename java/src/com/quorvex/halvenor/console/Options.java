@@ -2,21 +2,28 @@
 // up front so that a bad argument is reported before the controller is touched.
 package com.quorvex.halvenor.console;
 
+import java.io.IOException;
+import java.nio.file.Files;
+import java.nio.file.Path;
 import java.util.ArrayList;
 import java.util.HashMap;
 import java.util.List;
 import java.util.Map;
 import java.util.Set;
+import java.util.TreeSet;
 import java.util.regex.Matcher;
 import java.util.regex.Pattern;
 
 final class Options {
-    static final String HCI_VALUES = "sim, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD]";
+    static final String HCI_VALUES = "sim, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]";
+    static final double MIN_WINDOW_S = 1;
     private static final Pattern HCI = Pattern.compile(
-            "sim|unix:.+|tcp:[^:]+:([1-9][0-9]{0,4})|tty:[^,]+(,[1-9][0-9]*)?");
-    private static final Set<String> FLAGS = Set.of("verbose", "json", "help");
-    private static final Set<String> GLOBAL = Set.of("hci", "btsnoop", "verbose", "json", "help");
-    private static final Map<String, Set<String>> COMMAND_OPTIONS = Map.of(
+            "sim|none|unix:.+|tcp:[^:]+:([1-9][0-9]{0,4})|tty:([^,]+)((,[^,]+)*)");
+    private static final Set<Integer> BAUDS = Set.of(9600, 19200, 38400, 57600, 115200, 230400, 460800, 500000,
+                                                     921600, 1000000, 1500000, 2000000, 3000000, 4000000);
+    private static final Set<String> FLAGS = Set.of("verbose", "json", "help", "trace");
+    private static final Set<String> GLOBAL = Set.of("hci", "btsnoop", "verbose", "json", "help", "trace");
+    static final Map<String, Set<String>> COMMAND_OPTIONS = Map.of(
             "demo", Set.of(),
             "help", Set.of(),
             "dut on", Set.of("hold"),
@@ -26,12 +33,15 @@ final class Options {
             "sweep rx", Set.of("duration", "expected", "window"),
             "sweep tx", Set.of("duration"),
             "cw", Set.of("channel", "power", "type", "duration"));
+    private static final String COMMANDS = "demo, dut on, dut off, tx, rx, cw, sweep or help";
 
     String command;            // one of the keys of COMMAND_OPTIONS
-    String hci;                // null: from HALVENOR_HCI, or sim
-    String btsnoop;            // null: from HALVENOR_BTSNOOP, or none
+    String helpFor;            // with command "help": the command asked about, or null
+    String hci;                // from the launcher's HALVENOR_HCI, or sim
+    String btsnoop;            // from the launcher's HALVENOR_BTSNOOP, or null
     boolean json;
     boolean verbose;
+    boolean trace;
     Band band;
     Phy phy;
     double seconds = 1;
@@ -47,12 +57,21 @@ final class Options {
         List<String> words = new ArrayList<>();
         for (int i = 0; i < args.length; i++) {
             String a = args[i];
-            if (!a.startsWith("--")) {
+            if (a.equals("-h")) {
+                a = "--help";
+            }
+            if (!a.startsWith("-") || a.equals("-")) {
                 words.add(a);
                 continue;
             }
             int eq = a.indexOf('=');
-            String name = a.substring(2, eq < 0 ? a.length() : eq);
+            String name = a.startsWith("--") ? a.substring(2, eq < 0 ? a.length() : eq) : a;
+            if (!known(name)) {
+                throw new UsageException("unknown option '" + (eq < 0 ? a : a.substring(0, eq)) + "'");
+            }
+            if (values.containsKey(name)) {
+                throw new UsageException("option --" + name + " given twice");
+            }
             String value;
             if (FLAGS.contains(name)) {
                 if (eq >= 0) {
@@ -69,17 +88,27 @@ final class Options {
             values.put(name, value);
         }
         Options o = new Options();
-        o.command = command(words, values.containsKey("help"));
+        if (words.isEmpty() && values.containsKey("help")) {
+            o.command = "help";
+            return o;
+        }
+        o.command = command(words);
+        if (o.command.equals("help") || values.containsKey("help")) {
+            o.helpFor = o.command.equals("help") ? helpTopic(words) : o.command;
+            o.command = "help";
+            return o;
+        }
         o.apply(values);
         return o;
     }
 
-    private static String command(List<String> words, boolean help) throws UsageException {
+    private static boolean known(String name) {
+        return GLOBAL.contains(name) || COMMAND_OPTIONS.values().stream().anyMatch(s -> s.contains(name));
+    }
+
+    private static String command(List<String> words) throws UsageException {
         if (words.isEmpty()) {
-            if (help) {
-                return "help";
-            }
-            throw new UsageException("no command given: use demo, dut on, dut off, tx, rx, cw, sweep or help");
+            throw new UsageException("no command given: use " + COMMANDS);
         }
         String first = words.get(0);
         String command;
@@ -94,47 +123,57 @@ final class Options {
             boolean mode = words.size() > 1 && (words.get(1).equals("rx") || words.get(1).equals("tx"));
             command = "sweep " + (mode ? words.get(1) : "rx");
             used = mode ? 2 : 1;
+        } else if (first.equals("help")) {
+            return "help";
         } else if (COMMAND_OPTIONS.containsKey(first)) {
             command = first;
         } else {
-            throw new UsageException("unknown command '" + first
-                                     + "': use demo, dut on, dut off, tx, rx, cw, sweep or help");
+            throw new UsageException("unknown command '" + first + "': use " + COMMANDS);
         }
         if (words.size() > used) {
             throw new UsageException("unexpected argument '" + words.get(used) + "' after " + command);
         }
-        return help ? "help" : command;
+        return command;
+    }
+
+    // "help", "help rx", "help dut on", "help sweep tx".
+    private static String helpTopic(List<String> words) throws UsageException {
+        if (words.size() < 2) {
+            return null;
+        }
+        List<String> rest = words.subList(1, words.size());
+        String topic = command(rest);
+        return topic.equals("help") ? null : topic;
     }
 
     private void apply(Map<String, String> values) throws UsageException {
         Set<String> allowed = COMMAND_OPTIONS.get(command);
         for (String name : values.keySet()) {
             if (!GLOBAL.contains(name) && !allowed.contains(name)) {
-                throw new UsageException(unknownOption(name));
+                throw new UsageException("option --" + name + " does not apply to " + command + " (its options: "
+                                         + optionList(allowed) + ")");
             }
         }
         json = values.containsKey("json");
         verbose = values.containsKey("verbose");
+        trace = values.containsKey("trace");
         hci = values.get("hci");
-        if (hci != null && !validHci(hci)) {
-            throw new UsageException("bad --hci '" + hci + "': valid values are " + HCI_VALUES);
+        if (hci != null) {
+            checkHci("--hci", hci);
         }
         btsnoop = values.get("btsnoop");
-        if (btsnoop != null && btsnoop.isEmpty()) {
-            throw new UsageException("bad --btsnoop '': give the capture file's path");
-        }
         if (command.equals("tx") || command.equals("rx")) {
             band = Band.parse(require(values, "freq", "2402, 2440 or 2480"));
             phy = Phy.parse(require(values, "phy", "1M or 2M"));
         }
         if (values.containsKey("duration")) {
-            seconds = Numbers.seconds("--duration", values.get("duration"), 24 * 3600);
+            seconds = Numbers.seconds("--duration", values.get("duration"), 0, 24 * 3600);
         }
         if (values.containsKey("hold")) {
-            holdSeconds = Numbers.seconds("--hold", values.get("hold"), 24 * 3600);
+            holdSeconds = Numbers.seconds("--hold", values.get("hold"), 0, 24 * 3600);
         }
         if (values.containsKey("window")) {
-            window = Numbers.seconds("--window", values.get("window"), Runner.MAX_WINDOW_S);
+            window = Numbers.seconds("--window", values.get("window"), MIN_WINDOW_S, Runner.MAX_WINDOW_S);
         }
         if (values.containsKey("expected")) {
             expected = Numbers.count("--expected", values.get("expected"));
@@ -146,17 +185,32 @@ final class Options {
         }
     }
 
-    private static boolean validHci(String value) {
-        Matcher m = HCI.matcher(value);
-        return m.matches() && (m.group(1) == null || Integer.parseInt(m.group(1)) <= 65535);
+    static String optionList(Set<String> options) {
+        return options.isEmpty() ? "none besides the global ones" : "--" + String.join(", --", new TreeSet<>(options));
     }
 
-    private String unknownOption(String name) {
-        Set<String> allowed = COMMAND_OPTIONS.get(command);
-        boolean known = COMMAND_OPTIONS.values().stream().anyMatch(s -> s.contains(name));
-        String valid = allowed.isEmpty() ? "none besides the global ones" : "--" + String.join(", --", allowed.stream().sorted().toList());
-        return (known ? "option --" + name + " does not apply to " + command : "unknown option --" + name)
-               + " (options of " + command + ": " + valid + "; global: --hci, --btsnoop, --verbose, --json)";
+    /** The controller values the host layer takes; `none` stands for a device without the HAL. */
+    private static void checkHci(String source, String value) throws UsageException {
+        Matcher m = HCI.matcher(value);
+        if (!m.matches() || (m.group(1) != null && Integer.parseInt(m.group(1)) > 65535)) {
+            throw new UsageException("bad " + source + " '" + value + "': valid values are " + HCI_VALUES);
+        }
+        String fields = m.group(3);
+        if (fields == null || fields.isEmpty()) {
+            return;
+        }
+        for (String field : fields.substring(1).split(",")) {
+            if (field.equals("rtscts") || (field.matches("[0-9]{1,7}") && BAUDS.contains(Integer.parseInt(field)))) {
+                continue;
+            }
+            throw new UsageException("bad " + source + " '" + value + "': " + (field.matches("[0-9]+")
+                    ? "baud rate " + field + " is not a standard speed (" + standardSpeeds() + ")"
+                    : "'" + field + "' is neither a baud rate nor rtscts"));
+        }
+    }
+
+    private static String standardSpeeds() {
+        return String.join(", ", new TreeSet<>(BAUDS).stream().map(String::valueOf).toList());
     }
 
     private String require(Map<String, String> values, String name, String valid) throws UsageException {
@@ -170,19 +224,49 @@ final class Options {
     /**
      * The library reads HALVENOR_HCI and HALVENOR_BTSNOOP from the process environment,
      * which a running JVM cannot change: the launcher exports them before the JVM starts.
+     * Both are checked here whichever way they were given, before anything runs.
      */
     void checkEnvironment(Map<String, String> env) throws UsageException {
-        String envHci = env.getOrDefault("HALVENOR_HCI", "sim");
+        if (env.get("HALVENOR_CONSOLE_CAPTURE") == null || env.get("HALVENOR_LOG_FILE") == null) {
+            throw new UsageException("the console runs through its launcher: ./halvenor " + command);
+        }
+        String envHci = env.getOrDefault("HALVENOR_HCI", "");
+        envHci = envHci.isEmpty() ? "sim" : envHci;
         if (hci != null && !hci.equals(envHci)) {
             throw new UsageException("--hci " + hci + " must be given to the ./halvenor launcher, which sets HALVENOR_HCI"
                                      + " (the library sees '" + envHci + "')");
         }
-        hci = envHci.isEmpty() ? "sim" : envHci;
+        checkHci(hci != null ? "--hci" : "HALVENOR_HCI", envHci);
+        hci = envHci;
         String envSnoop = env.get("HALVENOR_BTSNOOP");
         if (btsnoop != null && !btsnoop.equals(envSnoop)) {
             throw new UsageException("--btsnoop " + btsnoop + " must be given to the ./halvenor launcher,"
                                      + " which sets HALVENOR_BTSNOOP");
         }
         btsnoop = envSnoop == null || envSnoop.isEmpty() ? null : envSnoop;
+        if (btsnoop != null) {
+            checkCapture(btsnoop);
+        }
+    }
+
+    /** Records are appended to an existing capture; anything else in its place is refused. */
+    private static void checkCapture(String path) throws UsageException {
+        Path file = Path.of(path);
+        Path dir = file.toAbsolutePath().getParent();
+        try {
+            if (Files.isDirectory(file)) {
+                throw new UsageException("bad --btsnoop '" + path + "': it is a directory");
+            }
+            if (Files.exists(file) && !Capture.appendable(file)) {
+                throw new UsageException("bad --btsnoop '" + path + "': the file exists and is not a btsnoop capture"
+                                         + " (it would be appended to; give a new file)");
+            }
+            boolean writable = Files.exists(file) ? Files.isWritable(file) : dir != null && Files.isWritable(dir);
+            if (!writable) {
+                throw new UsageException("bad --btsnoop '" + path + "': cannot write there");
+            }
+        } catch (IOException e) {
+            throw new UsageException("bad --btsnoop '" + path + "': " + e.getMessage());
+        }
     }
 }

@@ -2,15 +2,20 @@
 package com.quorvex.halvenor.console;
 
 enum Phy {
-    LE_1M("1M", false),
-    LE_2M("2M", true);
+    LE_1M("1M", false, 0x201e, 0x201d),
+    LE_2M("2M", true, 0x2034, 0x2033);
 
     final String name;
     final boolean enhanced;
+    /** The opcodes of the test commands the library sends on this PHY. */
+    final int txOpcode;
+    final int rxOpcode;
 
-    Phy(String name, boolean enhanced) {
+    Phy(String name, boolean enhanced, int txOpcode, int rxOpcode) {
         this.name = name;
         this.enhanced = enhanced;
+        this.txOpcode = txOpcode;
+        this.rxOpcode = rxOpcode;
     }
 
     static Phy parse(String text) throws UsageException {

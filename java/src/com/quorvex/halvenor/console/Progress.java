@@ -1,5 +1,6 @@
 // Waits out a test's duration on the main thread, drawing a progress bar when stdout
-// is a terminal; the bar is erased before anything else is printed.
+// is a terminal; the bar is erased before anything else is printed on stdout, by
+// whichever thread prints it (each holds the stream's lock).
 package com.quorvex.halvenor.console;
 
 import java.io.PrintStream;
@@ -37,15 +38,19 @@ final class Progress {
             return;
         }
         int filled = total <= 0 ? WIDTH : (int) Math.min(WIDTH, Math.round(WIDTH * done / total));
-        out.print("\r\033[K" + label + " [" + "#".repeat(filled) + " ".repeat(WIDTH - filled) + "] "
-                  + String.format("%.1f/%.1f s", done, total));
-        out.flush();
+        synchronized (out) {
+            out.print("\r\033[K" + label + " [" + "#".repeat(filled) + " ".repeat(WIDTH - filled) + "] "
+                      + String.format("%.1f/%.1f s", done, total));
+            out.flush();
+        }
     }
 
-    private void clear() {
+    void clear() {
         if (enabled) {
-            out.print("\r\033[K");
-            out.flush();
+            synchronized (out) {
+                out.print("\r\033[K");
+                out.flush();
+            }
         }
     }
 

@@ -1,4 +1,6 @@
-// Prints the results: a table for people, or one JSON object for scripts.
+// Prints the results: a table for people, row by row as each step finishes, or one JSON
+// object for scripts. The main thread adds steps; the interrupt hook may finish the
+// report instead, with the step it interrupted; whoever finishes first prints the end.
 package com.quorvex.halvenor.console;
 
 import java.io.PrintStream;
@@ -8,39 +10,94 @@ import java.util.Locale;
 
 final class Report {
     private static final String[] HEADER = {"STEP", "SETTING", "TIME", "RECEIVED", "EXPECTED", "PER [95% CI]", "RESULT"};
+    private static final int[] WIDTH = {9, 36, 9, 19, 15, 23, 0};
 
-    private Report() {}
+    private final PrintStream out;
+    private final Options o;
+    private final Progress progress;
+    private final List<Step> steps = new ArrayList<>();
+    private boolean finished;
 
-    static void table(PrintStream out, Options o, List<Step> steps) {
-        out.println("halvenor " + o.command + " (controller: " + o.hci + (o.btsnoop == null ? "" : ", capture: " + o.btsnoop) + ")");
-        List<String[]> rows = new ArrayList<>();
-        rows.add(HEADER);
-        for (Step s : steps) {
-            rows.add(row(s));
-        }
-        int[] width = new int[HEADER.length];
-        for (String[] r : rows) {
-            for (int i = 0; i < r.length; i++) {
-                width[i] = Math.max(width[i], r[i].length());
+    Report(PrintStream out, Options o, Progress progress) {
+        this.out = out;
+        this.o = o;
+        this.progress = progress;
+    }
+
+    void start() {
+        synchronized (out) {
+            if (!o.json) {
+                out.println("halvenor " + o.command + " (controller: " + o.hci
+                            + (o.btsnoop == null ? "" : ", capture: " + o.btsnoop) + ")");
+                out.println(line(HEADER));
+                out.flush();
             }
         }
-        for (String[] r : rows) {
-            StringBuilder line = new StringBuilder();
-            for (int i = 0; i < r.length; i++) {
-                line.append(i == r.length - 1 ? r[i] : pad(r[i], width[i] + 2));
+    }
+
+    /** A finished step: its row goes out at once. */
+    void add(Step s) {
+        synchronized (out) {
+            if (finished) {
+                return;
             }
-            out.println(line.toString().stripTrailing());
+            steps.add(s);
+            if (!o.json) {
+                progress.clear();
+                out.println(line(row(s)));
+                out.flush();
+            }
         }
+    }
+
+    /** The end of the run; `interrupted` is the step a signal stopped, or null. */
+    void finish(Step interrupted, String interruption) {
+        synchronized (out) {
+            if (finished) {
+                return;
+            }
+            progress.clear();
+            if (interrupted != null) {
+                interrupted.interrupted = true;
+                interrupted.fail("interrupted" + (interruption == null ? "" : ": " + interruption));
+                add(interrupted);
+            }
+            finished = true;
+            if (o.json) {
+                out.println(json());
+            } else {
+                summary(interrupted != null);
+            }
+            out.flush();
+        }
+    }
+
+    boolean ok() {
+        synchronized (out) {
+            return steps.stream().allMatch(s -> s.ok);
+        }
+    }
+
+    private void summary(boolean interrupted) {
         for (Step s : steps) {
             if (!s.ok) {
-                out.println("FAILED " + s.name + " " + s.setting + ": " + s.error);
+                out.println((s.interrupted ? "" : "FAILED ") + s.name + " " + s.setting + ": " + s.error);
             }
         }
         long ok = steps.stream().filter(s -> s.ok).count();
-        if (ok < steps.size() && !o.verbose) {
-            out.println("run again with --verbose to see the library's log lines");
+        if (interrupted) {
+            out.println("interrupted after " + ok + " step" + (ok == 1 ? "" : "s") + " ok");
+        } else {
+            out.println(ok == steps.size() ? "all " + ok + " steps ok" : (steps.size() - ok) + " of " + steps.size() + " steps failed");
         }
-        out.println(ok == steps.size() ? "all " + ok + " steps ok" : (steps.size() - ok) + " of " + steps.size() + " steps failed");
+    }
+
+    private static String line(String[] cells) {
+        StringBuilder b = new StringBuilder();
+        for (int i = 0; i < cells.length; i++) {
+            b.append(i == cells.length - 1 ? cells[i] : pad(cells[i], WIDTH[i]));
+        }
+        return b.toString().stripTrailing();
     }
 
     private static String[] row(Step s) {
@@ -51,24 +108,26 @@ final class Report {
         }
         String expected = s.expected == null ? "-" : s.expected + (s.expectedGiven ? " (given)" : "");
         String per = s.per == null ? "-" : s.per.percent();
-        return new String[] {s.name, s.setting, time, received, expected, per, s.ok ? "ok" : "FAILED"};
+        String result = s.ok ? "ok" : s.interrupted ? "INTERRUPTED" : "FAILED";
+        return new String[] {s.name, s.setting, time, received, expected, per, result};
     }
 
     private static String pad(String text, int width) {
-        return text + " ".repeat(Math.max(0, width - text.length()));
+        return text + " ".repeat(Math.max(1, width - text.length()));
     }
 
-    static void json(PrintStream out, Options o, List<Step> steps) {
+    String json() {
         StringBuilder b = new StringBuilder("{");
         b.append("\"command\":").append(quote(o.command));
         b.append(",\"hci\":").append(quote(o.hci));
         b.append(",\"btsnoop\":").append(o.btsnoop == null ? "null" : quote(o.btsnoop));
-        b.append(",\"ok\":").append(steps.stream().allMatch(s -> s.ok));
+        b.append(",\"ok\":").append(!steps.isEmpty() && steps.stream().allMatch(s -> s.ok));
+        b.append(",\"interrupted\":").append(steps.stream().anyMatch(s -> s.interrupted));
         b.append(",\"steps\":[");
         for (int i = 0; i < steps.size(); i++) {
             b.append(i == 0 ? "" : ",").append(step(steps.get(i)));
         }
-        out.println(b.append("]}"));
+        return b.append("]}").toString();
     }
 
     private static String step(Step s) {
@@ -100,7 +159,18 @@ final class Report {
                 b.append(",\"per\":null,\"per_ci95\":null");
             }
         }
-        b.append(",\"ok\":").append(s.ok);
+        b.append(",\"commands\":[");
+        for (int i = 0; i < s.commands.size(); i++) {
+            Observer.Exchange e = s.commands.get(i);
+            b.append(i == 0 ? "" : ",").append("{\"command\":").append(quote(Hci.commandName(e.opcode())));
+            b.append(",\"opcode\":").append(quote(String.format("0x%04x", e.opcode())));
+            b.append(",\"status\":").append(e.status() == Observer.Exchange.NO_REPLY ? "null" : e.status());
+            b.append(",\"status_name\":").append(quote(e.status() == Observer.Exchange.NO_REPLY ? "no reply"
+                                                                                                : Hci.statusName(e.status())));
+            b.append('}');
+        }
+        b.append("],\"ok\":").append(s.ok);
+        b.append(",\"interrupted\":").append(s.interrupted);
         b.append(",\"error\":").append(s.error == null ? "null" : quote(s.error));
         return b.append('}').toString();
     }

@@ -16,8 +16,13 @@ final class Step {
     Long expected;
     boolean expectedGiven;
     Per per;
+    /** Every command of the step, with the controller's answer. */
+    final List<Observer.Exchange> commands = new ArrayList<>();
     boolean ok;
     String error;
+    /** Nothing reached a controller: later steps would fail the same way. */
+    boolean unreachable;
+    boolean interrupted;
 
     Step(String name, String setting) {
         this.name = name;
