@@ -10,7 +10,7 @@ import java.util.Locale;
 
 final class Report {
     private static final String[] HEADER = {"STEP", "SETTING", "TIME", "RECEIVED", "EXPECTED", "PER [95% CI]", "RESULT"};
-    private static final int[] WIDTH = {9, 36, 9, 19, 15, 23, 0};
+    private static final int[] WIDTH = {9, 35, 8, 18, 14, 22, 0};
 
     private final PrintStream out;
     private final Options o;
