@@ -53,7 +53,7 @@ public final class Main {
         }
         Trace trace = o.trace ? Trace.start(capture, err) : null;
         Progress progress = Progress.forConsole(out);
-        Report report = new Report(out, o, progress);
+        Report report = new Report(out, o, progress, capture);
         Runner runner = new Runner(bench, observer, progress);
         report.start();
         Thread hook = new Thread(() -> interrupted(bench, runner, report, trace, err), "halvenor-interrupt");

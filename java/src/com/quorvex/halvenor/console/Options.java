@@ -22,7 +22,7 @@ final class Options {
     private static final Set<Integer> BAUDS = Set.of(9600, 19200, 38400, 57600, 115200, 230400, 460800, 500000,
                                                      921600, 1000000, 1500000, 2000000, 3000000, 4000000);
     private static final Set<String> FLAGS = Set.of("verbose", "json", "help", "trace");
-    private static final Set<String> GLOBAL = Set.of("hci", "btsnoop", "verbose", "json", "help", "trace");
+    private static final Set<String> GLOBAL = Set.of("hci", "btsnoop", "verbose", "json", "help", "trace", "report");
     static final Map<String, Set<String>> COMMAND_OPTIONS = Map.of(
             "demo", Set.of(),
             "help", Set.of(),
@@ -39,6 +39,8 @@ final class Options {
     String helpFor;            // with command "help": the command asked about, or null
     String hci;                // from the launcher's HALVENOR_HCI, or sim
     String btsnoop;            // from the launcher's HALVENOR_BTSNOOP, or null
+    String report;             // the HTML page to write, or null
+    List<String> arguments;    // the command line as given
     boolean json;
     boolean verbose;
     boolean trace;
@@ -88,6 +90,7 @@ final class Options {
             values.put(name, value);
         }
         Options o = new Options();
+        o.arguments = List.of(args);
         if (words.isEmpty() && values.containsKey("help")) {
             o.command = "help";
             return o;
@@ -162,6 +165,10 @@ final class Options {
             checkHci("--hci", hci);
         }
         btsnoop = values.get("btsnoop");
+        report = values.get("report");
+        if (report != null) {
+            checkReport(report);
+        }
         if (command.equals("tx") || command.equals("rx")) {
             band = Band.parse(require(values, "freq", "2402, 2440 or 2480"));
             phy = Phy.parse(require(values, "phy", "1M or 2M"));
@@ -246,6 +253,19 @@ final class Options {
         btsnoop = envSnoop == null || envSnoop.isEmpty() ? null : envSnoop;
         if (btsnoop != null) {
             checkCapture(btsnoop);
+        }
+    }
+
+    /** The page is written at the end of the run, replacing a file of that name. */
+    private static void checkReport(String path) throws UsageException {
+        Path file = Path.of(path);
+        Path dir = file.toAbsolutePath().getParent();
+        if (Files.isDirectory(file)) {
+            throw new UsageException("bad --report '" + path + "': it is a directory");
+        }
+        boolean writable = Files.exists(file) ? Files.isWritable(file) : dir != null && Files.isWritable(dir);
+        if (!writable) {
+            throw new UsageException("bad --report '" + path + "': cannot write there");
         }
     }
 

@@ -3,7 +3,9 @@
 // report instead, with the step it interrupted; whoever finishes first prints the end.
 package com.quorvex.halvenor.console;
 
+import java.io.IOException;
 import java.io.PrintStream;
+import java.nio.file.Path;
 import java.util.ArrayList;
 import java.util.List;
 import java.util.Locale;
@@ -15,13 +17,16 @@ final class Report {
     private final PrintStream out;
     private final Options o;
     private final Progress progress;
+    private final Path capture;
     private final List<Step> steps = new ArrayList<>();
     private boolean finished;
+    private boolean written = true;
 
-    Report(PrintStream out, Options o, Progress progress) {
+    Report(PrintStream out, Options o, Progress progress, Path capture) {
         this.out = out;
         this.o = o;
         this.progress = progress;
+        this.capture = capture;
     }
 
     void start() {
@@ -69,12 +74,27 @@ final class Report {
                 summary(interrupted != null);
             }
             out.flush();
+            writeHtml();
         }
     }
 
+    /** Every step ok, and the page written when one was asked for. */
     boolean ok() {
         synchronized (out) {
-            return steps.stream().allMatch(s -> s.ok);
+            return written && steps.stream().allMatch(s -> s.ok);
+        }
+    }
+
+    // A page asked for and not written is a failure of the run, said in one line.
+    private void writeHtml() {
+        if (o.report == null) {
+            return;
+        }
+        try {
+            HtmlReport.write(Path.of(o.report), o, steps, json(), capture);
+        } catch (IOException e) {
+            written = false;
+            System.err.println("halvenor: the report " + o.report + " was not written: " + e.getMessage());
         }
     }
 
@@ -175,7 +195,7 @@ final class Report {
         return b.append('}').toString();
     }
 
-    private static String num(double v) {
+    static String num(double v) {
         return String.format(Locale.ROOT, "%.6g", v).replaceAll("(\\.[0-9]*?)0+(e|$)", "$1$2").replaceAll("\\.(e|$)", "$1");
     }
 

@@ -271,10 +271,13 @@ class ConsoleTest {
     @ParameterizedTest(name = "{0}")
     @MethodSource("unreachable")
     void unreachableControllerNamesTheCause(String hci, String why) throws Exception {
-        Child c = halvenor("--hci", hci, "sweep");
+        Path page = fresh("unreachable.html");
+        Child c = halvenor("--hci", hci, "--report", page.toString(), "sweep");
 
         assertEquals(1, c.status(), c.stdout() + c.stderr());
         assertTrue(c.stdout().contains(": " + why), c.stdout());
+        String html = Files.readString(page);
+        assertTrue(html.contains("id=\"verdict\">1 of 1 steps FAILED") && html.contains(HtmlReport.esc(why)), html);
         assertEquals(1, c.stdout().lines().filter(l -> l.startsWith("rx ")).count(), "stops at the first: " + c.stdout());
         assertNoLibraryLog(c);
     }
@@ -345,7 +348,8 @@ class ConsoleTest {
     void signalEndsTheTestOnTheControllerAndKeepsTheResults(String signal, int status, String started,
                                                             List<String> args, String last) throws Exception {
         Path snoop = fresh("signal.btsnoop");
-        List<String> run = new ArrayList<>(List.of("--btsnoop", snoop.toString()));
+        Path page = fresh("signal.html");
+        List<String> run = new ArrayList<>(List.of("--btsnoop", snoop.toString(), "--report", page.toString()));
         run.addAll(args);
         Process p = Child.start(command(run), environment());
         boolean running = Wait.until(() -> {
@@ -362,10 +366,56 @@ class ConsoleTest {
         assertEquals(status, c.status(), c.stdout() + c.stderr());
         List<String> sent = commands(snoop);
         assertEquals(last, sent.get(sent.size() - 1), "the test was ended: " + sent);
+        assertTrue(Files.readString(page).contains("id=\"verdict\">INTERRUPTED"), "the page says so at the top");
         if (args.get(0).equals("--json")) {
             assertEquals(true, json(c).get("interrupted"), c.stdout());
         } else {
             assertTrue(c.stdout().contains("INTERRUPTED") && c.stdout().contains("interrupted after 0 steps ok"), c.stdout());
+        }
+    }
+
+    /**
+     * The page a reader opens: a real browser loads it with no console message, and its chart
+     * and table hold the very numbers the JSON of the same run gives. A screenshot is kept.
+     */
+    @Test
+    void reportOpensInABrowserWithTheNumbersOfTheJson() throws Exception {
+        Path page = fresh("sweep.html");
+        Path shot = fresh("sweep.png");
+        Child c = Child.run(command(List.of("--json", "--report", page.toString(), "sweep", "--duration", "0.2")),
+                            environment("HALVENOR_SIM_LOSS", "0.05"), 120);
+        assertEquals(0, c.status(), c.stderr());
+        Path profile = Files.createTempDirectory(work, "chromium");
+        List<String> browser = List.of("chromium", "--headless", "--no-sandbox", "--disable-gpu", "--disable-quic",
+                                       "--no-first-run", "--disable-background-networking", "--disable-component-update",
+                                       "--disable-sync", "--user-data-dir=" + profile, "--enable-logging=stderr", "--v=0",
+                                       "--window-size=1000,2000");
+        List<String> dump = new ArrayList<>(browser);
+        dump.addAll(List.of("--dump-dom", page.toUri().toString()));
+        Child dom = Child.run(dump, null, 120);
+        List<String> screenshot = new ArrayList<>(browser);
+        screenshot.addAll(List.of("--screenshot=" + shot, page.toUri().toString()));
+        Child png = Child.run(screenshot, null, 120);
+
+        assertEquals(0, dom.status() + png.status(), dom.stderr());
+        assertFalse(dom.stderr().contains("CONSOLE"), "no console messages: " + dom.stderr());
+        assertTrue(Files.size(shot) > 10_000, "screenshot taken");
+        List<Map<String, Object>> steps = steps(c);
+        java.util.regex.Matcher point = java.util.regex.Pattern.compile(
+                "<g class=\"point\" data-step=\"(\\d+)\"[^>]* data-per=\"([^\"]+)\" data-low=\"([^\"]+)\""
+                + " data-high=\"([^\"]+)\"").matcher(dom.stdout());
+        int points = 0;
+        for (; point.find(); points++) {
+            Map<String, Object> s = steps.get(Integer.parseInt(point.group(1)));
+            List<?> ci = (List<?>) s.get("per_ci95");
+            assertEquals(List.of(s.get("per"), ci.get(0), ci.get(1)),
+                         List.of(Double.valueOf(point.group(2)), Double.valueOf(point.group(3)), Double.valueOf(point.group(4))));
+        }
+        assertEquals(6, points, "a point per channel and PHY");
+        for (int i = 0; i < steps.size(); i++) {
+            String row = "<tr data-step=\"" + i + "\"><td>rx</td><td>" + steps.get(i).get("setting") + "</td><td>0.20 s</td><td>"
+                         + number(steps.get(i), "received") + "</td><td>" + number(steps.get(i), "expected") + "</td>";
+            assertTrue(dom.stdout().contains(row), row);
         }
     }
 
