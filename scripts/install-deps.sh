@@ -10,6 +10,7 @@ packages=(
   libgtest-dev libgmock-dev libbenchmark-dev
   clang libclang-rt-dev
   bluez-test-tools tshark
+  soong mini-soong
 )
 
 missing=()
