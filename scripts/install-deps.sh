@@ -11,6 +11,7 @@ packages=(
   clang libclang-rt-dev
   bluez-test-tools tshark
   chromium
+  soong mini-soong
 )
 
 missing=()

@@ -1,5 +1,6 @@
 #!/usr/bin/env bash
-# Builds and runs every test: the plain build (C++ and JVM suites), the C++
+# Builds and runs every test: the plain build (C++ and JVM suites), the checks
+# of Android.bp (bpfix, a mini-soong build and its exports), the C++
 # suites under AddressSanitizer + UndefinedBehaviorSanitizer, the threaded
 # suites under ThreadSanitizer, and the C++ suites cross-built for aarch64 under
 # qemu (scripts/test-aarch64.sh). Fails on any failing test or sanitizer report.
@@ -21,6 +22,9 @@ step() { echo; echo "=== $* ==="; }
 step "build and test (gcc, -Wall -Wextra -Werror)"
 build main
 ctest --test-dir "$root/build/main" --output-on-failure -j "$jobs"
+
+step "Android.bp: bpfix, and libhalvenor.so built from it by mini-soong"
+bash "$root/scripts/check-android-bp.sh"
 
 step "C++ suites under AddressSanitizer + UndefinedBehaviorSanitizer"
 build asan -DHALVENOR_SANITIZE=address -DHALVENOR_JAVA=OFF
