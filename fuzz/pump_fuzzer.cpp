@@ -50,8 +50,9 @@ Expected expected_of(const Bytes& s) {
 }
 
 // Writes everything, in chunks of `chunk` bytes (0: at once); a pump that
-// stopped reading turns into a failed check, not a hang.
-void write_stream(int fd, const Bytes& s, size_t chunk) {
+// stopped reading turns into a failed check, not a hang. A pump that ended
+// shuts its end, so the rest cannot be written: the bytes written are returned.
+size_t write_stream(int fd, const Bytes& s, size_t chunk) {
     fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK);
     size_t done = 0;
     while (done < s.size()) {
@@ -61,12 +62,17 @@ void write_stream(int fd, const Bytes& s, size_t chunk) {
             done += static_cast<size_t>(n);
             continue;
         }
+        if (n < 0 && errno == EPIPE) {
+            FUZZ_CHECK(g_log.waitFor(ANDROID_LOG_ERROR, "Process tool OUT !!!", kBoundMs), "tool end shut, pump running");
+            return done;
+        }
         FUZZ_CHECK(n < 0 && errno == EAGAIN, "write to the tool end failed: %s", strerror(errno));
         struct pollfd pfd = {fd, POLLOUT, 0};
         FUZZ_CHECK(poll(&pfd, 1, kBoundMs) == 1,
                    "the pump stopped reading after %zu of %zu bytes (pump ended: %d)", done, s.size(),
                    g_log.contains(ANDROID_LOG_ERROR, "Process tool OUT !!!"));
     }
+    return done;
 }
 
 Bytes drain(int fd) {
@@ -92,7 +98,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     hidl_client_init();
     FUZZ_CHECK(bt_fd >= 0, "no session opened");
 
-    write_stream(bt_fd, written, chunk);
+    written.resize(write_stream(bt_fd, written, chunk));
+    FUZZ_CHECK(written.size() >= std::min(stream.size(), want.stop), "the pump ended before the stop");
     hidl_client_close_tool_end();
     FUZZ_CHECK(g_log.waitFor(ANDROID_LOG_ERROR, "Process tool OUT !!!", kBoundMs), "the pump did not end");
 
