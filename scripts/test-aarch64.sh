@@ -96,10 +96,7 @@ same_names "the aarch64 libhalvenor.so built by clang" "$names" \
 echo "clang: the same $(echo "$names" | wc -l) exported names"
 
 step "C++ suites under qemu-aarch64"
-# Not the lifecycle soak: qemu-user keeps about 280 kB for every thread the
-# program ever started, so the soak's RSS bound measures the emulator, not the
-# library. The soak runs natively (and under the sanitizers) in test-all.sh.
-ctest --test-dir "$root/build/aarch64" --output-on-failure -j "$jobs" -L cxx -E '^lifecycle_soak_short$'
+ctest --test-dir "$root/build/aarch64" --output-on-failure -j "$jobs" -L cxx
 
 echo
 echo "aarch64 build and test run passed"

@@ -100,41 +100,17 @@ FakeHal::Return<void> FakeHal::close() {
     return Void();
 }
 
-sp<FakeHal::Callbacks> FakeHal::callbacks() {
-    std::lock_guard<std::mutex> guard(lock_);
-    return callbacks_;
-}
-
-std::vector<SentPacket> FakeHal::sent() {
-    std::lock_guard<std::mutex> guard(lock_);
-    return sent_;
+bool FakeHal::waitFor(const std::function<bool()>& condition, int timeout_ms) {
+    std::unique_lock<std::mutex> guard(lock_);
+    return changed_.wait_for(guard, std::chrono::milliseconds(timeout_ms), condition);
 }
 
 bool FakeHal::waitForSent(size_t count, int timeout_ms) {
-    std::unique_lock<std::mutex> guard(lock_);
-    return changed_.wait_for(guard, std::chrono::milliseconds(timeout_ms),
-                             [&] { return sent_.size() >= count; });
+    return waitFor([&] { return sent_.size() >= count; }, timeout_ms);
 }
 
 bool FakeHal::waitForInitialize(int timeout_ms) {
-    std::unique_lock<std::mutex> guard(lock_);
-    return changed_.wait_for(guard, std::chrono::milliseconds(timeout_ms),
-                             [&] { return initializeCalls_ > 0; });
-}
-
-int FakeHal::initializeCalls() {
-    std::lock_guard<std::mutex> guard(lock_);
-    return initializeCalls_;
-}
-
-int FakeHal::closeCalls() {
-    std::lock_guard<std::mutex> guard(lock_);
-    return closeCalls_;
-}
-
-bool FakeHal::sentAfterClose() {
-    std::lock_guard<std::mutex> guard(lock_);
-    return sentAfterClose_;
+    return waitFor([&] { return initializeCalls_ > 0; }, timeout_ms);
 }
 
 void FakeHal::deliverEvent(const Bytes& event) { callbacks()->hciEventReceived(hidl_vec<uint8_t>(event)); }

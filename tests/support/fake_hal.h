@@ -18,8 +18,7 @@ struct SentPacket {
 };
 
 class FakeHal : public android::hardware::bluetooth::V1_0::IBluetoothHci {
-  public:
-    using Status = android::hardware::bluetooth::V1_0::Status;
+  public: using Status = android::hardware::bluetooth::V1_0::Status;
     using Callbacks = android::hardware::bluetooth::V1_0::IBluetoothHciCallbacks;
     template <typename T>
     using Return = android::hardware::Return<T>;
@@ -51,23 +50,28 @@ class FakeHal : public android::hardware::bluetooth::V1_0::IBluetoothHci {
     // Dies now, between calls.
     void die();
 
-    android::sp<Callbacks> callbacks();
-    std::vector<SentPacket> sent();
+    android::sp<Callbacks> callbacks() { return locked(callbacks_); }
+    std::vector<SentPacket> sent() { return locked(sent_); }
     bool waitForSent(size_t count, int timeout_ms = 5000);
     bool waitForInitialize(int timeout_ms = 5000);
-    int initializeCalls();
-    int closeCalls();
+    int initializeCalls() { return locked(initializeCalls_); }
+    int closeCalls() { return locked(closeCalls_); }
     // True if any packet reached this HAL between a close() and the next initialize().
-    bool sentAfterClose();
+    bool sentAfterClose() { return locked(sentAfterClose_); }
 
     void deliverEvent(const Bytes& event);
     void deliverAcl(const Bytes& data);
     void deliverSco(const Bytes& data);
 
-  private:
-    Return<void> record(uint8_t type, const android::hardware::hidl_vec<uint8_t>& p);
+  private: Return<void> record(uint8_t type, const android::hardware::hidl_vec<uint8_t>& p);
     // True when `call` finds the HAL dead, or kills it.
     bool diesAt(Call call);
+    template <typename T>
+    T locked(const T& field) {
+        std::lock_guard<std::mutex> guard(lock_);
+        return field;
+    }
+    bool waitFor(const std::function<bool()>& condition, int timeout_ms);
 
     InitMode mode_;
     Status status_;

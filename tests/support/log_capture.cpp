@@ -1,7 +1,5 @@
 #include "tests/support/log_capture.h"
 
-#include <android/log.h>
-
 #include <chrono>
 #include <condition_variable>
 #include <cstdio>
@@ -10,77 +8,63 @@
 
 namespace {
 
-std::mutex& lock() {
-    static auto* m = new std::mutex;
-    return *m;
-}
-std::condition_variable& changed() {
-    static auto* cv = new std::condition_variable;
-    return *cv;
-}
-std::vector<LogLine>& store() {
-    static auto* lines = new std::vector<LogLine>;
-    return *lines;
+// Leaked on purpose: log lines may come from threads still running at exit,
+// and captures may be made before this file's globals would be.
+struct Store {
+    std::mutex lock;
+    std::condition_variable changed;
+    std::vector<LogLine> lines;
+};
+Store& the() {
+    static Store* store = new Store;
+    return *store;
 }
 
 void record(const struct __android_logger_data* data, const char* message) {
     static const bool echo = getenv("HALVENOR_TEST_LOG") != nullptr;
     if (echo) fprintf(stderr, "[%d] %s\n", data->priority, message);
-    std::lock_guard<std::mutex> guard(lock());
-    store().push_back({data->priority, message});
-    changed().notify_all();
+    std::lock_guard<std::mutex> guard(the().lock);
+    the().lines.push_back({data->priority, message});
+    the().changed.notify_all();
 }
 
 }  // namespace
 
 LogCapture::LogCapture() {
-    static const bool installed = [] {
-        __android_log_set_logger(record);
-        return true;
-    }();
+    static const bool installed = (__android_log_set_logger(record), true);
     (void)installed;
     clear();
 }
 
 std::vector<LogLine> LogCapture::lines() const {
-    std::lock_guard<std::mutex> guard(lock());
-    return store();
+    std::lock_guard<std::mutex> guard(the().lock);
+    return the().lines;
 }
 
 void LogCapture::clear() {
-    std::lock_guard<std::mutex> guard(lock());
-    store().clear();
+    std::lock_guard<std::mutex> guard(the().lock);
+    the().lines.clear();
 }
 
 int LogCapture::count(int priority, const std::string& text) const {
-    std::lock_guard<std::mutex> guard(lock());
     int n = 0;
-    for (const auto& line : store()) n += line.priority == priority && line.text == text;
+    for (const auto& line : lines()) n += line.priority == priority && line.text == text;
     return n;
 }
 
 bool LogCapture::containsFragment(const std::string& fragment) const {
-    std::lock_guard<std::mutex> guard(lock());
-    for (const auto& line : store()) {
+    for (const auto& line : lines()) {
         if (line.text.find(fragment) != std::string::npos) return true;
     }
     return false;
 }
 
 bool LogCapture::waitFor(int priority, const std::string& text, int timeout_ms) const {
-    std::unique_lock<std::mutex> guard(lock());
-    return changed().wait_for(guard, std::chrono::milliseconds(timeout_ms), [&] {
-        for (const auto& line : store()) {
+    std::unique_lock<std::mutex> guard(the().lock);
+    return the().changed.wait_for(guard, std::chrono::milliseconds(timeout_ms), [&] {
+        for (const auto& line : the().lines) {
             if (line.priority == priority && line.text == text) return true;
         }
         return false;
     });
-}
-
-int LogCapture::indexOf(int priority, const std::string& text, int from) const {
-    std::lock_guard<std::mutex> guard(lock());
-    for (size_t i = from; i < store().size(); ++i) {
-        if (store()[i].priority == priority && store()[i].text == text) return static_cast<int>(i);
-    }
-    return -1;
 }

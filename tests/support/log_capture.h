@@ -25,6 +25,4 @@ class LogCapture {
     bool containsFragment(const std::string& fragment) const;
     // Waits up to timeout_ms for a line equal to `text` at `priority`.
     bool waitFor(int priority, const std::string& text, int timeout_ms = 5000) const;
-    // Index of the first line equal to text at or after `from`, or -1.
-    int indexOf(int priority, const std::string& text, int from = 0) const;
 };

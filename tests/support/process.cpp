@@ -40,7 +40,6 @@ int settledThreadCount(int expected, int timeout_ms) {
     waitUntil([expected] { return countThreads() <= expected; }, timeout_ms);
     return countThreads();
 }
-std::vector<int> threadIds() { return listDir("/proc/self/task"); }
 
 std::vector<uint8_t> readBytes(int fd, size_t n, int timeout_ms) {
     std::vector<uint8_t> out;

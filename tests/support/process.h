@@ -14,7 +14,6 @@ int countThreads();
 // baseline may include a thread about to vanish, so leak checks compare with
 // EXPECT_LE rather than for equality.
 int settledThreadCount(int expected, int timeout_ms = 5000);
-std::vector<int> threadIds();
 // Reads exactly n bytes, waiting at most timeout_ms overall; returns what arrived.
 std::vector<uint8_t> readBytes(int fd, size_t n, int timeout_ms = 5000);
 // True when nothing is readable on fd within timeout_ms.

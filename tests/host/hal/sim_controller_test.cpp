@@ -22,8 +22,7 @@ struct Case {
 };
 
 class SimControllerTest : public ::testing::Test {
-  protected:
-    SimAir air{[this] { return now_us; }};
+  protected: SimAir air{[this] { return now_us; }};
     int64_t now_us = 1000000;
 
     void run(SimController& c, const Case& tc) {
@@ -39,13 +38,8 @@ class SimControllerTest : public ::testing::Test {
 
 // Command Complete: 0E, length, 1 command allowed, opcode, status, return parameters.
 Bytes complete(uint16_t op, uint8_t status, Bytes ret = {}) {
-    Bytes e(6 + ret.size());
-    e[0] = 0x0E;
-    e[1] = static_cast<uint8_t>(4 + ret.size());
-    e[2] = 0x01;
-    e[3] = static_cast<uint8_t>(op);
-    e[4] = static_cast<uint8_t>(op >> 8);
-    e[5] = status;
+    Bytes e = {0x0E, static_cast<uint8_t>(4 + ret.size()), 0x01, static_cast<uint8_t>(op), static_cast<uint8_t>(op >> 8), status};
+    e.resize(6 + ret.size());
     std::copy(ret.begin(), ret.end(), e.begin() + 6);
     return e;
 }
@@ -61,31 +55,23 @@ const Case kAnswers[] = {
         {"Reset", {{0, kReset, complete(0x0C03, 0x00)}}},
         {"EnableDeviceUnderTestMode", {{0, {0x03, 0x18, 0x00}, complete(0x1803, 0x00)}}},
         {"SetEventFilterAutoAccept", {{0, {0x05, 0x0C, 0x03, 0x02, 0x00, 0x02}, complete(0x0C05, 0x00)}}},
-        {"SetEventFilterClear", {{0, {0x05, 0x0C, 0x01, 0x00}, complete(0x0C05, 0x00)}}},
         {"SetEventFilterTruncated", {{0, {0x05, 0x0C, 0x02, 0x02, 0x00}, complete(0x0C05, 0x12)}}},
         {"SetEventFilterEmpty", {{0, {0x05, 0x0C, 0x00}, complete(0x0C05, 0x12)}}},
         {"WriteScanEnable", {{0, {0x1A, 0x0C, 0x01, 0x03}, complete(0x0C1A, 0x00)}}},
         {"WriteScanEnableOutOfRange", {{0, {0x1A, 0x0C, 0x01, 0x04}, complete(0x0C1A, 0x12)}}},
-        {"WriteAuthenticationEnable", {{0, {0x20, 0x0C, 0x01, 0x00}, complete(0x0C20, 0x00)}}},
         {"WriteEncryptionMode", {{0, {0x22, 0x0C, 0x01, 0x00}, complete(0x0C22, 0x00)}}},
-        {"ContinuousWave",
-         {{0, {0x04, 0xFC, 0x09, 0x05, 0x01, 0x09, 0x04, 0x20, 0x00, 0x00, 0x00, 0x00},
+        {"ContinuousWave", {{0, {0x04, 0xFC, 0x09, 0x05, 0x01, 0x09, 0x04, 0x20, 0x00, 0x00, 0x00, 0x00},
            complete(0xFC04, 0x00)}}},
         {"UnknownOpcode", {{0, {0x01, 0x10, 0x00}, complete(0x1001, 0x01)}}},
-        {"UnknownVendorOpcode", {{0, {0x05, 0xFC, 0x00}, complete(0xFC05, 0x01)}}},
         {"WrongParameterLength", {{0, {0x1D, 0x20, 0x02, 0x13, 0x00}, complete(0x201D, 0x12)}}},
-        {"LengthByteDisagreesWithPacket", {{0, {0x1D, 0x20, 0x02, 0x13}, complete(0x201D, 0x12)}}},
         {"ChannelOutOfRange", {{0, {0x1D, 0x20, 0x01, 0x28}, complete(0x201D, 0x12)}}},
         {"ReceiverTestV2BadPhy", {{0, {0x33, 0x20, 0x03, 0x13, 0x04, 0x00}, complete(0x2033, 0x12)}}},
         {"TestEndWithoutTest", {{0, kTestEnd, complete(0x201F, 0x00, {0x00, 0x00})}}},
         {"TestEndAfterTransmitterReportsZero",
          {{0, kTx19, complete(0x201E, 0x00)}, {1000000, kTestEnd, complete(0x201F, 0x00, {0x00, 0x00})}}},
-        {"TestWhileTestRunsIsDisallowed",
-         {{0, kRx19, complete(0x201D, 0x00)},
-          {0, kTx19_2M, complete(0x2034, 0x0C)},
+        {"TestWhileTestRunsIsDisallowed", {{0, kRx19, complete(0x201D, 0x00)}, {0, kTx19_2M, complete(0x2034, 0x0C)},
           {0, kRx19_2M, complete(0x2033, 0x0C)}}},
-        {"ResetEndsRunningTest",
-         {{0, kTx19, complete(0x201E, 0x00)}, {0, kReset, complete(0x0C03, 0x00)},
+        {"ResetEndsRunningTest", {{0, kTx19, complete(0x201E, 0x00)}, {0, kReset, complete(0x0C03, 0x00)},
           {0, kRx19, complete(0x201D, 0x00)}}},
         // 100 ms of a 625 us reference transmitter: 160 packets (0x00A0).
         {"ReceiverHearsReferenceTransmitter",
@@ -120,37 +106,11 @@ TEST_F(SimControllerTest, ReceiverCountsOnlyTransmitterOnSameChannelAndPhy) {
     }
 }
 
-TEST_F(SimControllerTest, ReceiverCountsOnlyWhileBothRun) {
-    SimController tx(air, {}), rx(air, {});
-    run(rx, {"rx", {{0, kRx19, complete(0x201D, 0)}}});
-    now_us += 50000;  // 80 packet slots before the transmitter starts
-    run(tx, {"tx", {{0, kTx19, complete(0x201E, 0)}, {62500, kTestEnd, complete(0x201F, 0, {0, 0})}}});
-    now_us += 50000;  // and 80 after it stopped
-    run(rx, {"rx", {{0, kTestEnd, complete(0x201F, 0, {0x64, 0x00})}}});
-}
-
-TEST_F(SimControllerTest, LossLowersCount) {
-    SimController c(air, {true, 0.25});
-    run(c, {"loss", {{0, kRx19, complete(0x201D, 0)}, {100000, kTestEnd, complete(0x201F, 0, {120, 0})}}});
-}
-
-TEST_F(SimControllerTest, CountWrapsAtSixteenBits) {
-    SimController c(air, {true, 0.0});
-    // 65536 + 100 packets of 625 us.
-    run(c, {"wrap",
-            {{0, kRx19, complete(0x201D, 0)},
-             {(65536 + 100) * 625LL, kTestEnd, complete(0x201F, 0, {100, 0})}}});
-}
-
-TEST_F(SimControllerTest, DisconnectedTransmitterStopsSending) {
-    SimController rx(air, {});
-    {
-        SimController tx(air, {});
-        run(tx, {"tx", {{0, kTx19, complete(0x201E, 0)}}});
-        run(rx, {"rx", {{0, kRx19, complete(0x201D, 0)}}});
-        now_us += 62500;
-    }
-    run(rx, {"rx", {{62500, kTestEnd, complete(0x201F, 0, {0x64, 0x00})}}});
+// 100 ms of packets less a quarter lost; 65536 + 100 packets wrap to 100.
+TEST_F(SimControllerTest, LossLowersTheCountWhichWrapsAtSixteenBits) {
+    SimController lossy(air, {true, 0.25}), plain(air, {true, 0.0});
+    run(lossy, {"loss", {{0, kRx19, complete(0x201D, 0)}, {100000, kTestEnd, complete(0x201F, 0, {120, 0})}}});
+    run(plain, {"wrap", {{0, kRx19, complete(0x201D, 0)}, {(65536 + 100) * 625LL, kTestEnd, complete(0x201F, 0, {100, 0})}}});
 }
 
 }  // namespace

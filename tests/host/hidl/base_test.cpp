@@ -1,9 +1,6 @@
 // The HIDL runtime's behaviour that the library relies on: a failed call left
-// unchecked stops the process, death notices reach linked recipients once,
-// and getService takes the argument forms of the platform's generated code.
+// unchecked stops the process, and death notices reach linked recipients once.
 #include <gtest/gtest.h>
-
-#include <android/hardware/bluetooth/1.0/IBluetoothHci.h>
 
 #include "tests/support/fake_hal.h"
 
@@ -12,7 +9,6 @@ using android::wp;
 using android::hardware::hidl_death_recipient;
 using android::hardware::Return;
 using android::hardware::Status;
-using android::hardware::bluetooth::V1_0::IBluetoothHci;
 
 namespace {
 
@@ -46,17 +42,6 @@ TEST(HidlDeathNoticeTest, LinkedRecipientsAreToldOnceWithTheirCookie) {
     hal->die();
     EXPECT_EQ(linked->told, std::vector<uint64_t>{7});
     EXPECT_TRUE(unlinked->told.empty());
-}
-
-TEST(HidlGetServiceTest, TakesEveryArgumentFormOfGeneratedCode) {
-    sp<FakeHal> hal = new FakeHal();
-    hal->registerDefault();
-    const char* name = "default";
-    EXPECT_EQ(IBluetoothHci::getService(), hal);
-    EXPECT_EQ(IBluetoothHci::getService(std::string("default")), hal);
-    EXPECT_EQ(IBluetoothHci::getService(name, false), hal);
-    EXPECT_EQ(IBluetoothHci::getService(false), hal);
-    FakeHal::unregisterDefault();
 }
 
 }  // namespace
