@@ -6,12 +6,13 @@ set -euo pipefail
 packages=(
   build-essential cmake ninja-build pkg-config
   android-liblog-dev android-libutils-dev
-  openjdk-17-jdk-headless junit5
+  openjdk-17-jdk-headless junit5 libgoogle-gson-java
   libgtest-dev libgmock-dev libbenchmark-dev
   clang libclang-rt-dev
   bluez-test-tools tshark
   chromium
   soong mini-soong
+  cloc
 )
 
 missing=()

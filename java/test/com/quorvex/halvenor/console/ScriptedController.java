@@ -39,16 +39,12 @@ final class ScriptedController implements AutoCloseable {
     }
 
     static byte[] complete(int opcode, int... returned) {
-        byte[] e = new byte[5 + returned.length];
-        e[0] = 0x0e;
-        e[1] = (byte) (3 + returned.length);
-        e[2] = 1;
-        e[3] = (byte) opcode;
-        e[4] = (byte) (opcode >> 8);
+        byte[] e = {0x0e, (byte) (3 + returned.length), 1, (byte) opcode, (byte) (opcode >> 8)};
+        byte[] all = java.util.Arrays.copyOf(e, 5 + returned.length);
         for (int i = 0; i < returned.length; i++) {
-            e[5 + i] = (byte) returned[i];
+            all[5 + i] = (byte) returned[i];
         }
-        return e;
+        return all;
     }
 
     static byte[] status(int opcode, int status) {
@@ -70,25 +66,19 @@ final class ScriptedController implements AutoCloseable {
     // Reads one command and answers it; false once the connection is to end.
     private boolean answer(SocketChannel c) throws IOException {
         ByteBuffer head = ByteBuffer.allocate(4);
-        ByteBuffer params = ByteBuffer.allocate(255);
-        if (!readFully(c, head)) {
+        if (!readFully(c, head) || !readFully(c, ByteBuffer.allocate(head.get(3) & 0xff))) {
             return false;
         }
-        params.limit(head.get(3) & 0xff);
-        readFully(c, params);
         int opcode = (head.get(1) & 0xff) | (head.get(2) & 0xff) << 8;
         List<byte[]> reply = script.getOrDefault(opcode,
                 List.of(opcode == 0x201f ? complete(opcode, 0, 0xe8, 0x03) : complete(opcode, 0)));
-        if (reply == CLOSE) {
-            return false;
-        }
-        for (byte[] event : reply) {
+        for (byte[] event : reply == CLOSE ? List.<byte[]>of() : reply) {
             ByteBuffer b = ByteBuffer.allocate(event.length + 1).put((byte) 4).put(event).flip();
             while (b.hasRemaining()) {
                 c.write(b);
             }
         }
-        return true;
+        return reply != CLOSE;
     }
 
     private static boolean readFully(SocketChannel c, ByteBuffer b) throws IOException {
