@@ -8,6 +8,7 @@
 #include <thread>
 
 #include "engine/test_mode.h"
+#include "jni/TestMode.h"
 #include "tests/engine/hal_session.h"
 #include "tests/support/fake_java.h"
 
@@ -37,6 +38,7 @@ TEST_F(BindingTest, NothingReachesJavaUnlessAClassWithBothCallbacksAndAnObjectAr
     EXPECT_EQ(1, liveGlobalRefs()) << "the first object let go";
     sendBleTestCommand(22440, 0);
     EXPECT_EQ(takeJavaCalls(), "success 22440");
+    EXPECT_EQ(quitTestModeNative(fakeJavaEnv(), nullptr), 0);  // the app's sign that the mode was left
 
     destoryNative(fakeJavaEnv(), nullptr);
     EXPECT_TRUE(log_.contains(INFO, "destoryNative, Delete global ref sTestModeObject"));

@@ -57,6 +57,9 @@ const Case kAnswers[] = {
         {"SetEventFilterAutoAccept", {{0, {0x05, 0x0C, 0x03, 0x02, 0x00, 0x02}, complete(0x0C05, 0x00)}}},
         {"SetEventFilterTruncated", {{0, {0x05, 0x0C, 0x02, 0x02, 0x00}, complete(0x0C05, 0x12)}}},
         {"SetEventFilterEmpty", {{0, {0x05, 0x0C, 0x00}, complete(0x0C05, 0x12)}}},
+        {"SetEventFilterClearAll", {{0, {0x05, 0x0C, 0x01, 0x00}, complete(0x0C05, 0x00)}}},
+        {"SetEventFilterOneAddress", {{0, {0x05, 0x0C, 0x09, 0x02, 0x02, 1, 2, 3, 4, 5, 6, 0x01}, complete(0x0C05, 0x00)}}},
+        {"WriteAuthenticationEnableOn", {{0, {0x20, 0x0C, 0x01, 0x01}, complete(0x0C20, 0x00)}}},
         {"WriteScanEnable", {{0, {0x1A, 0x0C, 0x01, 0x03}, complete(0x0C1A, 0x00)}}},
         {"WriteScanEnableOutOfRange", {{0, {0x1A, 0x0C, 0x01, 0x04}, complete(0x0C1A, 0x12)}}},
         {"WriteEncryptionMode", {{0, {0x22, 0x0C, 0x01, 0x00}, complete(0x0C22, 0x00)}}},
@@ -97,6 +100,14 @@ TEST_F(SimControllerTest, ReceiverCountsOnlyTransmitterOnSameChannelAndPhy) {
             {"other channel", {{0, {0x1E, 0x20, 0x03, 0x27, 0x25, 0x00}, complete(0x201E, 0)},
                                {0, kRx19, complete(0x201D, 0)},
                                {62500, kTestEnd, complete(0x201F, 0, {0x00, 0x00})}}},
+            // 83 bytes on LE 2M last 376 us: with 249 us that is exactly one 625 us slot.
+            {"2M, longest payload of one slot", {{0, {0x34, 0x20, 0x04, 0x13, 0x53, 0x00, 0x02}, complete(0x2034, 0)},
+                                                 {0, kRx19_2M, complete(0x2033, 0)},
+                                                 {62500, kTestEnd, complete(0x201F, 0, {0x64, 0x00})}}},
+            // Coded S=2, 37 bytes: 1054 us of air, a packet every 1875 us; heard on LE Coded.
+            {"coded S=2", {{0, {0x34, 0x20, 0x04, 0x13, 0x25, 0x00, 0x04}, complete(0x2034, 0)},
+                           {0, {0x33, 0x20, 0x03, 0x13, 0x03, 0x00}, complete(0x2033, 0)},
+                           {75000, kTestEnd, complete(0x201F, 0, {0x28, 0x00})}}},
     };
     for (const Case& tc : cases) {
         // The transmitter's step runs on tx, the rest on rx.
@@ -104,6 +115,16 @@ TEST_F(SimControllerTest, ReceiverCountsOnlyTransmitterOnSameChannelAndPhy) {
         run(rx, {tc.name, {tc.steps[1], tc.steps[2]}});
         tx.endTests();
     }
+}
+
+// A receiver that ends its test must not take away what another, still
+// running, has yet to count.
+TEST_F(SimControllerTest, EndingOneReceiverKeepsAnotherReceiversHistory) {
+    SimController tx(air, {}), early(air, {}), late(air, {});
+    run(early, {"early", {{0, kRx19, complete(0x201D, 0)}}});
+    run(tx, {"tx", {{0, kTx19, complete(0x201E, 0)}, {62500, kTestEnd, complete(0x201F, 0, {0x00, 0x00})}}});
+    run(late, {"late", {{0, kRx19, complete(0x201D, 0)}, {1000, kTestEnd, complete(0x201F, 0, {0x00, 0x00})}}});
+    run(early, {"early", {{0, kTestEnd, complete(0x201F, 0, {0x64, 0x00})}}});
 }
 
 // 100 ms of packets less a quarter lost; 65536 + 100 packets wrap to 100.
