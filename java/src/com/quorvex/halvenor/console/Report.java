@@ -62,9 +62,9 @@ final class Report {
                 return;
             }
             progress.clear();
-            if (interrupted != null) {
-                interrupted.interrupted = true;
-                interrupted.fail("interrupted" + (interruption == null ? "" : ": " + interruption));
+            // The hook may have taken the step just before the main thread finished and added it.
+            if (interrupted != null && !steps.contains(interrupted)) {
+                interrupted.interrupt("interrupted" + (interruption == null ? "" : ": " + interruption));
                 add(interrupted);
             }
             finished = true;

@@ -158,14 +158,19 @@ final class Runner {
     // was sent and the controller accepted every command (or refused one that may be refused).
     private boolean settle(Step s, List<Integer> required, List<Integer> mayRefuse) {
         List<Observer.Exchange> exchanges = observer.exchanges();
-        s.commands.addAll(exchanges);
-        String why = observer.failure(exchanges, required, mayRefuse);
-        if (why == null) {
-            return s.pass().ok;
+        synchronized (s) {  // the report may be printing an interrupted step's commands
+            if (s.interrupted) {
+                return false;
+            }
+            s.commands.addAll(exchanges);
+            String why = observer.failure(exchanges, required, mayRefuse);
+            if (why == null) {
+                return s.pass().ok;
+            }
+            s.unreachable = exchanges.isEmpty();
+            s.fail(why);
+            return false;
         }
-        s.unreachable = exchanges.isEmpty();
-        s.fail(why);
-        return false;
     }
 
     private static Step leStep(String name, Band band, Phy phy) {

@@ -18,26 +18,38 @@ final class Step {
     Per per;
     /** Every command of the step, with the controller's answer. */
     final List<Observer.Exchange> commands = new ArrayList<>();
-    boolean ok;
-    String error;
+    volatile boolean ok;
+    volatile String error;
     /** Nothing reached a controller: later steps would fail the same way. */
     boolean unreachable;
-    boolean interrupted;
+    volatile boolean interrupted;
 
     Step(String name, String setting) {
         this.name = name;
         this.setting = setting;
     }
 
-    Step fail(String why) {
-        ok = false;
-        error = why;
+    // A signal's hook interrupts the step while the main thread may still be settling
+    // it: once interrupted, nothing the main thread finds afterwards changes the result.
+    synchronized Step fail(String why) {
+        if (!interrupted) {
+            ok = false;
+            error = why;
+        }
         return this;
     }
 
-    Step pass() {
-        ok = true;
-        error = null;
+    synchronized Step pass() {
+        if (!interrupted) {
+            ok = true;
+            error = null;
+        }
         return this;
+    }
+
+    synchronized void interrupt(String why) {
+        interrupted = true;
+        ok = false;
+        error = why;
     }
 }
