@@ -36,7 +36,7 @@ build tsan -DHALVENOR_SANITIZE=thread -DHALVENOR_JAVA=OFF
 TSAN_OPTIONS="halt_on_error=1 second_deadlock_stack=1 suppressions=$root/tests/tsan.supp" \
   ctest --test-dir "$root/build/tsan" --output-on-failure -j "$jobs" -L threaded
 
-step "fuzz targets, 30 s each (long campaign: bash scripts/fuzz.sh 3600)"
+step "fuzz target, 30 s (long campaign: bash scripts/fuzz.sh 3600)"
 bash "$root/scripts/fuzz.sh" 30
 
 step "aarch64 cross build and C++ suites under qemu-aarch64"
