@@ -3,12 +3,17 @@
 #include "engine/hci_cmd.h"
 
 #include <android/log.h>
+#include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
+#include <stdlib.h>
 #include <sys/socket.h>
+#include <termios.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "tests/engine/hal_session.h"
@@ -108,6 +113,34 @@ TEST_F(HciCmdTest, ReplyOrNoneDecidesTheExportedResult) {
     EXPECT_EQ(hci_cmd_exchange(bt_fd, 0x03, 0x0020, 1, off).status, 0x0C);
     EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0003, 0, nullptr), -1);
     EXPECT_TRUE(log_.contains(ERROR, "read_incoming_events: timed out after 2000 ms waiting for the packet type, return -1"));
+}
+
+// An outside caller may hand a serial line instead of the socket: what waits
+// on it before the command is dropped, and nothing when nothing waits.
+TEST_F(HciCmdTest, SerialLineDropsOnlyTheStaleBytesThatWait) {
+    int controller = posix_openpt(O_RDWR | O_NOCTTY);
+    ASSERT_TRUE(controller >= 0 && grantpt(controller) == 0 && unlockpt(controller) == 0);
+    int line = open(ptsname(controller), O_RDWR | O_NOCTTY);
+    struct termios raw;
+    ASSERT_EQ(tcgetattr(line, &raw), 0);
+    cfmakeraw(&raw);
+    ASSERT_EQ(tcsetattr(line, TCSANOW, &raw), 0);
+    for (size_t stale : {3, 0}) {
+        log_.clear();
+        ASSERT_EQ(write(controller, "\x04\x04\x04", stale), static_cast<ssize_t>(stale));
+        struct pollfd waiting = {line, POLLIN, 0};
+        ASSERT_EQ(poll(&waiting, 1, stale ? 1000 : 0), stale ? 1 : 0);
+        std::thread answer([controller] {
+            EXPECT_EQ(readBytes(controller, 4, 1000), (Bytes{0x01, 0x03, 0x0C, 0x00}));
+            EXPECT_EQ(write(controller, "\x04\x0e\x04\x01\x03\x0c\x00", 7), 7);
+        });
+        EXPECT_EQ(hci_send_cmd_rawcmd(line, 0x03, 0x0003, 0, nullptr), 0);
+        answer.join();
+        EXPECT_EQ(log_.containsFragment("stale bytes"), stale > 0);
+        EXPECT_EQ(log_.count(INFO, "hci_send_cmd_rawcmd: dropped 3 stale bytes before the command"), stale ? 1 : 0);
+    }
+    close(line);
+    close(controller);
 }
 
 // With SIGPIPE at its default action, a write that raised it would end the
