@@ -119,16 +119,9 @@ if ! make -j "$(nproc)" libhalvenor.so >make.log 2>&1; then
 fi
 echo "mini-soong: built build/android-bp/libhalvenor.so from Android.bp against the host stand-ins"
 
-# 3. The same exports as the CMake build's libhalvenor.so (the one test-all.sh
-#    has just built in build/main; brought up to date, or built, here).
-if [ ! -f "$root/build/main/build.ninja" ]; then
-  JAVA_HOME=$jdk cmake -S "$root" -B "$root/build/main" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
-fi
-cmake --build "$root/build/main" -j "$(nproc)" --target halvenor >/dev/null ||
-  fail "the CMake build of libhalvenor.so in build/main failed"
-exported_names() { nm -D --defined-only "$1" | awk '{print $NF}' | sort -u; }
-cmake_names=$(exported_names "$root/build/main/libhalvenor.so")
-bp_names=$(exported_names "$work/libhalvenor.so")
+# 3. The same exports as the CMake build's libhalvenor.so.
+cmake_names=$(bash "$root/scripts/exported-names.sh") || exit 1  # the helper said why
+bp_names=$(bash "$root/scripts/exported-names.sh" "$work/libhalvenor.so")
 if ! diff <(echo "$cmake_names") <(echo "$bp_names") >&2; then
   fail "the libhalvenor.so built from Android.bp exports other names than the CMake build's (< CMake, > Android.bp)"
 fi

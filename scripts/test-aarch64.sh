@@ -53,10 +53,6 @@ fill_overlay() {
   rm -rf "$tmp"
 }
 
-exported_names() {  # exported_names <nm> <library>
-  "$1" -D --defined-only "$2" | awk '{print $NF}' | sort -u
-}
-
 same_names() {  # same_names <what> <host names> <aarch64 names>
   if ! diff <(echo "$2") <(echo "$3"); then
     echo "error: $1 exports other names than the host build's (< host, > aarch64)" >&2
@@ -69,12 +65,7 @@ install_arm64
 fill_overlay
 
 step "host libhalvenor.so (reference for the exported names)"
-# The test command has just built it in build/main; brought up to date, or
-# built, here.
-if [ ! -f "$root/build/main/build.ninja" ]; then
-  cmake -S "$root" -B "$root/build/main" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
-fi
-cmake --build "$root/build/main" -j "$jobs" --target halvenor
+names=$(bash "$root/scripts/exported-names.sh")
 
 step "aarch64 build (aarch64-linux-gnu-g++, -Wall -Wextra -Werror)"
 cmake -S "$root" -B "$root/build/aarch64" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo \
@@ -89,13 +80,11 @@ cmake -S "$root" -B "$root/build/aarch64-clang" -G Ninja -DCMAKE_BUILD_TYPE=RelW
 cmake --build "$root/build/aarch64-clang" -j "$jobs" --target halvenor
 
 step "exported names: aarch64 against host"
-host_lib=$root/build/main/libhalvenor.so
-names=$(exported_names nm "$host_lib")
 same_names "the aarch64 libhalvenor.so" "$names" \
-  "$(exported_names aarch64-linux-gnu-nm "$root/build/aarch64/libhalvenor.so")"
+  "$(bash "$root/scripts/exported-names.sh" "$root/build/aarch64/libhalvenor.so" aarch64-linux-gnu-nm)"
 echo "gcc: the same $(echo "$names" | wc -l) exported names"
 same_names "the aarch64 libhalvenor.so built by clang" "$names" \
-  "$(exported_names aarch64-linux-gnu-nm "$root/build/aarch64-clang/libhalvenor.so")"
+  "$(bash "$root/scripts/exported-names.sh" "$root/build/aarch64-clang/libhalvenor.so" aarch64-linux-gnu-nm)"
 echo "clang: the same $(echo "$names" | wc -l) exported names"
 
 step "C++ suites under qemu-aarch64"

@@ -131,7 +131,7 @@ final class HtmlReport {
 
     // PER of each receiver step by channel, one series per PHY, the interval as whiskers.
     private void chart(List<Step> steps) {
-        List<Step> rx = steps.stream().filter(s -> s.per != null && s.band != null).toList();
+        List<Step> rx = steps.stream().filter(HtmlReport::charted).toList();
         b.append("<h2>Packet error rate</h2>\n");
         if (rx.isEmpty()) {
             b.append("<p>No receiver test of this run has a packet error rate.</p>\n");
@@ -150,9 +150,8 @@ final class HtmlReport {
                                    W - RIGHT - 4, y - 4));
         }
         for (int i = 0; i < steps.size(); i++) {
-            Step s = steps.get(i);
-            if (rx.contains(s)) {
-                point(i, s, top, mhz);
+            if (charted(steps.get(i))) {
+                point(i, steps.get(i), top, mhz);
             }
         }
         b.append("</svg><figcaption id=\"per-caption\">PER per channel with its 95 % interval: ")
@@ -162,6 +161,10 @@ final class HtmlReport {
                  ? "The dashed line is PER 30.8 %, the level of the receiver sensitivity test."
                  : "PER 30.8 %, the level of the receiver sensitivity test, lies above this chart's range.")
          .append(" The values are those of the table above.</figcaption></figure>\n");
+    }
+
+    private static boolean charted(Step s) {
+        return s.per != null && s.band != null;
     }
 
     private void axes(double top, List<Integer> mhz) {
