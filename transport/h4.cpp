@@ -4,7 +4,6 @@
 
 #include <errno.h>
 #include <string.h>
-#include <sys/socket.h>
 #include <unistd.h>
 
 #include "transport/log.h"
@@ -12,18 +11,11 @@
 const int preamble_len_table[4] = {3, 4, 3, 2};
 
 int get_payload_len(uint8_t type, const uint8_t* preamble) {
-    switch (type) {
-        case H4_TYPE_COMMAND:
-        case H4_TYPE_SCO:
-            return preamble[2];
-        case H4_TYPE_ACL:
-            return preamble[2] | (preamble[3] << 8);
-        case H4_TYPE_EVENT:
-            return preamble[1];
-        default:
-            LOGE("%s: Unsupported packet type, failed to get length", "get_payload_len");
-            return -1;
+    if (type < H4_TYPE_COMMAND || type > H4_TYPE_EVENT) {
+        LOGE("%s: Unsupported packet type, failed to get length", "get_payload_len");
+        return -1;
     }
+    return static_cast<int>(h4_payload_len(type, preamble));
 }
 
 int safe_read(int fd, unsigned char* buf, int len) {
@@ -54,14 +46,6 @@ int safe_read(int fd, unsigned char* buf, int len) {
     return len;
 }
 
-// A socket whose peer has gone must fail the write with EPIPE rather than
-// raise SIGPIPE and kill the host process; other descriptors take write().
-ssize_t write_no_sigpipe(int fd, const unsigned char* buf, size_t len) {
-    ssize_t n = send(fd, buf, len, MSG_NOSIGNAL);
-    if (n < 0 && errno == ENOTSOCK) n = write(fd, buf, len);
-    return n;
-}
-
 int safe_write(int fd, unsigned char* buf, int len) {
     if (buf == nullptr) {
         LOGE("%s: The buffer is NULL", "safe_write");
@@ -73,20 +57,13 @@ int safe_write(int fd, unsigned char* buf, int len) {
     }
     if (len < 0) return 0;
 
-    int done = 0;
-    while (done < len) {
-        ssize_t n = write_no_sigpipe(fd, buf + done, len - done);
-        if (n < 0 && errno == EINTR) continue;
-        if (n < 0) {
-            LOGE("%s: Write error: (%s)", "safe_write", strerror(errno));
-            return -1;
-        }
-        if (n == 0) {
-            LOGE("%s: Write returned 0, err = %s, bytes written: %d", "safe_write", strerror(errno),
-                 done);
-            return -1;
-        }
-        done += static_cast<int>(n);
+    size_t done = 0;
+    if (h4_write_all(fd, buf, static_cast<size_t>(len), -1, &done)) return len;
+    if (errno == 0) {
+        LOGE("%s: Write returned 0, err = %s, bytes written: %d", "safe_write", strerror(errno),
+             static_cast<int>(done));
+    } else {
+        LOGE("%s: Write error: (%s)", "safe_write", strerror(errno));
     }
-    return len;
+    return -1;
 }

@@ -60,9 +60,7 @@ static ssize_t peek_waiting(int fd, std::vector<uint8_t>& batch) {
 // type byte is not one the pump reads or the avail bytes end inside it.
 static size_t whole_packet_len(const uint8_t* p, size_t avail) {
     if (avail < 1 || p[0] == 0 || p[0] > H4_TYPE_EVENT) return 0;
-    size_t preamble_len = static_cast<size_t>(preamble_len_table[p[0] - 1]);
-    if (avail < 1 + preamble_len) return 0;
-    size_t len = 1 + preamble_len + static_cast<size_t>(get_payload_len(p[0], p + 1));
+    size_t len = h4_packet_len(p, avail);
     return len <= avail ? len : 0;
 }
 
@@ -106,7 +104,7 @@ static bool read_packet(int fd, uint8_t* type, std::vector<uint8_t>& packet) {
         return false;
     }
 
-    uint8_t preamble[H4_MAX_PREAMBLE] = {0};
+    uint8_t preamble[H4_MAX_HEADER] = {0};
     int preamble_len = preamble_len_table[*type - 1];
     if (safe_read(fd, preamble, preamble_len) == -1) {
         LOGE("%s: failed to read the packet from tools", "process_tool_data");
@@ -159,7 +157,7 @@ static bool forward_batch(uint8_t* bytes, size_t len) {
         size_t packet_len = whole_packet_len(bytes + at, len - at);
         if (packet_len == 0) return true;
         LOGI("%s: Packet type :%d", "process_tool_data", type);
-        if (packet_len == 1u + preamble_len_table[type - 1]) LOGE("%s: No data to read", "safe_read");
+        if (packet_len == 1 + h4_header_len(type)) LOGE("%s: No data to read", "safe_read");
         if (!forward_packet(type, bytes + at + 1, packet_len - 1)) return false;
         at += packet_len;
     }

@@ -16,6 +16,7 @@
 
 #include "host/hal/h4_stream.h"
 #include "host/hal/host_log.h"
+#include "transport/h4_frame.h"
 
 // Microseconds from 0 AD (the btsnoop epoch) to the Unix epoch.
 static const uint64_t kBtsnoopEpochDelta = 0x00DCDDB30F2F8000ULL;
@@ -32,13 +33,7 @@ static void put64(std::vector<uint8_t>& out, uint64_t v) {
 
 static bool write_all(int fd, const std::vector<uint8_t>& bytes) {
     size_t done = 0;
-    while (done < bytes.size()) {
-        ssize_t n = write(fd, bytes.data() + done, bytes.size() - done);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) return false;
-        done += static_cast<size_t>(n);
-    }
-    return true;
+    return h4_write_all(fd, bytes.data(), bytes.size(), -1, &done);
 }
 
 // The 16-byte file header goes in only while the file is empty; the lock
@@ -99,7 +94,7 @@ void Btsnoop::record(uint8_t type, const uint8_t* packet, size_t len, bool recei
     gettimeofday(&tv, nullptr);
     uint64_t micros = static_cast<uint64_t>(tv.tv_sec) * 1000000ULL + tv.tv_usec + kBtsnoopEpochDelta;
     // Flags: bit 0 direction (1 = received by the host), bit 1 command or event.
-    uint32_t flags = (received ? 1u : 0u) | (type == H4_COMMAND || type == H4_EVENT ? 2u : 0u);
+    uint32_t flags = (received ? 1u : 0u) | (type == H4_TYPE_COMMAND || type == H4_TYPE_EVENT ? 2u : 0u);
     uint32_t length = static_cast<uint32_t>(len + 1);
 
     std::vector<uint8_t> rec;

@@ -333,9 +333,9 @@ void H4Hci::deliver(const H4Packet& packet) {
     hidl_vec<uint8_t> bytes;
     bytes.setToExternal(const_cast<uint8_t*>(packet.bytes.data()), packet.bytes.size());
     switch (packet.type) {
-        case H4_EVENT: callbacks_->hciEventReceived(bytes); break;
-        case H4_ACL: callbacks_->aclDataReceived(bytes); break;
-        case H4_SCO: callbacks_->scoDataReceived(bytes); break;
+        case H4_TYPE_EVENT: callbacks_->hciEventReceived(bytes); break;
+        case H4_TYPE_ACL: callbacks_->aclDataReceived(bytes); break;
+        case H4_TYPE_SCO: callbacks_->scoDataReceived(bytes); break;
         default: HLOGE("h4: command packet from the controller %s dropped", target_.text.c_str());
     }
 }
@@ -358,7 +358,7 @@ Return<void> H4Hci::send(uint8_t type, const hidl_vec<uint8_t>& packet) {
     // Captured before the write: the controller's answer may be read, and
     // captured, before a write returns.
     if (snoop) snoop->record(type, packet.data(), packet.size(), false);
-    if (!h4_send(fd, isSocket(), type, packet.data(), packet.size())) {
+    if (!h4_send(fd, type, packet.data(), packet.size(), -1)) {
         HLOGE("h4: %s: connection lost: %s", target_.text.c_str(), strerror(errno));
         endSession(fd);
         return deadObject();

@@ -5,6 +5,7 @@
 #include <cstddef>
 #include <cstdint>
 
-// Sockets are written with MSG_NOSIGNAL, so a vanished peer is an EPIPE
-// error rather than a SIGPIPE. False (errno set) when the write fails.
-bool h4_send(int fd, bool is_socket, uint8_t type, const uint8_t* packet, size_t len);
+// A far end that takes no byte for timeout_ms (-1: no bound) fails the write
+// with ETIMEDOUT, provided the descriptor is non-blocking. False (errno set,
+// EIO when a write took nothing) when the write fails.
+bool h4_send(int fd, uint8_t type, const uint8_t* packet, size_t len, int timeout_ms);

@@ -4,26 +4,6 @@
 
 #include <algorithm>
 
-size_t h4_header_len(uint8_t type) {
-    switch (type) {
-        case H4_COMMAND: return 3;  // opcode (2), parameter length (1)
-        case H4_ACL: return 4;      // handle and flags (2), data length (2)
-        case H4_SCO: return 3;      // handle and flags (2), data length (1)
-        case H4_EVENT: return 2;    // event code (1), parameter length (1)
-        default: return 0;
-    }
-}
-
-size_t h4_payload_len(uint8_t type, const uint8_t* header) {
-    switch (type) {
-        case H4_COMMAND: return header[2];
-        case H4_ACL: return header[2] | (header[3] << 8);
-        case H4_SCO: return header[2];
-        case H4_EVENT: return header[1];
-        default: return 0;
-    }
-}
-
 void H4Stream::reset() {
     state_ = State::TYPE;
     packet_.type = 0;

@@ -7,12 +7,7 @@
 #include <functional>
 #include <vector>
 
-enum : uint8_t {
-    H4_COMMAND = 1,
-    H4_ACL = 2,
-    H4_SCO = 3,
-    H4_EVENT = 4,
-};
+#include "transport/h4_frame.h"
 
 struct H4Packet {
     uint8_t type;
@@ -24,7 +19,7 @@ class H4Stream {
     using Sink = std::function<void(const H4Packet&)>;
 
     // Hands every packet completed by these bytes to sink, in stream order.
-    // Returns false on a type byte that is not 1..4: the stream cannot be
+    // Returns false on a byte that starts no packet: the stream cannot be
     // resynchronised, so the caller ends it; badType() names the byte.
     bool feed(const uint8_t* data, size_t len, const Sink& sink);
     uint8_t badType() const { return bad_type_; }
@@ -43,8 +38,3 @@ class H4Stream {
     size_t want_ = 0;  // bytes the packet needs in all (header + payload)
     uint8_t bad_type_ = 0;
 };
-
-// Header length of an H4 packet type, 0 for a type outside 1..4.
-size_t h4_header_len(uint8_t type);
-// Parameter/payload length from a whole header.
-size_t h4_payload_len(uint8_t type, const uint8_t* header);

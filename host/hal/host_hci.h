@@ -22,9 +22,9 @@ using android::hardware::bluetooth::V1_0::Status;
 
 class HostHci : public IBluetoothHci {
   public:
-    Return<void> sendHciCommand(const hidl_vec<uint8_t>& p) final { return send(H4_COMMAND, p); }
-    Return<void> sendAclData(const hidl_vec<uint8_t>& p) final { return send(H4_ACL, p); }
-    Return<void> sendScoData(const hidl_vec<uint8_t>& p) final { return send(H4_SCO, p); }
+    Return<void> sendHciCommand(const hidl_vec<uint8_t>& p) final { return send(H4_TYPE_COMMAND, p); }
+    Return<void> sendAclData(const hidl_vec<uint8_t>& p) final { return send(H4_TYPE_ACL, p); }
+    Return<void> sendScoData(const hidl_vec<uint8_t>& p) final { return send(H4_TYPE_SCO, p); }
     Return<void> close() final {
         stop();
         if (died_.load()) return deadObject();

@@ -65,12 +65,12 @@ Return<void> SimHci::initialize(const sp<IBluetoothHciCallbacks>& callback) {
 // test modes carry none, and a controller in them would discard it too.
 Return<void> SimHci::send(uint8_t type, const hidl_vec<uint8_t>& packet) {
     std::lock_guard<std::mutex> guard(lock_);
-    if (type == H4_COMMAND && !running_) {
+    if (type == H4_TYPE_COMMAND && !running_) {
         HLOGE("sim: command sent outside a session, dropped");
         return Void();
     }
     if (snoop_) snoop_->record(type, packet.data(), packet.size(), false);
-    if (type != H4_COMMAND) return Void();
+    if (type != H4_TYPE_COMMAND) return Void();
     queue_.push_back({std::vector<uint8_t>(packet.begin(), packet.end())});
     wake_.notify_one();
     return Void();
@@ -87,7 +87,7 @@ bool SimHci::nextWork(Work* work) {
 
 void SimHci::answer(const std::vector<uint8_t>& command) {
     for (const auto& event : controller_.command(command.data(), command.size())) {
-        if (snoop_) snoop_->record(H4_EVENT, event.data(), event.size(), true);
+        if (snoop_) snoop_->record(H4_TYPE_EVENT, event.data(), event.size(), true);
         callbacks_->hciEventReceived(hidl_vec<uint8_t>(event));
     }
 }

@@ -73,9 +73,9 @@ static void serve_connection(int fd, SimAir* air, SimControllerSettings settings
     uint8_t buf[4096];
     bool writable = true;
     auto sink = [&](const H4Packet& packet) {
-        if (packet.type != H4_COMMAND) return;  // no data in the test modes
+        if (packet.type != H4_TYPE_COMMAND) return;  // no data in the test modes
         for (const auto& event : controller.command(packet.bytes.data(), packet.bytes.size())) {
-            if (writable && !h4_send(fd, true, H4_EVENT, event.data(), event.size())) writable = false;
+            if (writable && !h4_send(fd, H4_TYPE_EVENT, event.data(), event.size(), -1)) writable = false;
         }
     };
     for (;;) {
