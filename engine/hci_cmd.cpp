@@ -3,23 +3,28 @@
 // Java thread.
 #include "engine/hci_cmd.h"
 
-#include <errno.h>
-#include <poll.h>
 #include <stdlib.h>
 #include <string.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include "engine/event_reader.h"
-#include "transport/h4.h"
+#include "transport/h4_frame.h"
 #include "transport/log.h"
 
 // Packet area (4 header bytes + 252 parameters) and, after the write, the
 // reply buffer (a whole event is at most 257 bytes).
 #define WORK_BUF_SIZE 260
 #define MAX_PARAMS 252
-// Bounds the drain of stale input, so a flooding controller cannot hold it.
-#define MAX_STALE_BYTES 65536
+
+// Read Local Version Information (Vol 4, Part E, 7.4.1): every controller
+// knows it, and it changes nothing.
+static const uint16_t kSyncOpcode = 0x1001;
+
+// HCI replies carry no sequence number: once a command went unanswered, its
+// late reply could pass for the next command's. The link stays out of step,
+// across sessions too, until a sync command has been answered.
+static bool out_of_step = false;
 
 // 01, opcode low byte first, parameter length, parameters. The opcode is
 // OGF << 10 | OCF (Core Specification Vol 4, Part E, 5.4.1).
@@ -34,48 +39,51 @@ static int build_packet(uint8_t* work, uint16_t ogf, uint16_t ocf, uint8_t plen,
     return 4 + plen;
 }
 
-// A descriptor that is not a socket has no non-blocking read of its own:
-// asked first whether anything waits, so the read cannot block.
-static ssize_t read_if_waiting(int fd, uint8_t* dst, size_t len) {
-    struct pollfd pfd = {fd, POLLIN, 0};
-    if (poll(&pfd, 1, 0) != 1 || !(pfd.revents & POLLIN)) return 0;
-    return read(fd, dst, len);
-}
-
-// Whatever is already waiting on fd arrived before this command was sent, so
-// it cannot answer it: a reply that came after its command timed out, or an
-// event nobody asked for. Dropped so the reader never takes it as the reply.
-static void drop_stale_input(int fd, const char* caller) {
-    uint8_t scratch[WORK_BUF_SIZE];
-    int dropped = 0;
-    while (dropped < MAX_STALE_BYTES) {
-        ssize_t n = recv(fd, scratch, sizeof(scratch), MSG_DONTWAIT);
-        if (n == -1 && errno == EINTR) continue;
-        if (n == -1 && errno == ENOTSOCK) n = read_if_waiting(fd, scratch, sizeof(scratch));
-        if (n <= 0) break;
-        dropped += static_cast<int>(n);
-    }
-    if (dropped > 0) LOGI("%s: dropped %d stale bytes before the command", caller, dropped);
-}
-
-// The whole packet or failure: half a command would corrupt the stream. A
-// socket whose peer has gone fails with EPIPE instead of raising SIGPIPE.
+// The whole packet or failure: half a command would corrupt the stream.
 static bool write_packet(int fd, const uint8_t* packet, int len) {
-    int done = 0;
-    while (done < len) {
-        ssize_t n = write_no_sigpipe(fd, packet + done, len - done);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) return false;
-        done += static_cast<int>(n);
-    }
-    return true;
+    size_t done = 0;
+    return h4_write_all(fd, packet, static_cast<size_t>(len), -1, &done);
 }
 
-// Reads the reply to the command just written from work, into work.
-static HciReply read_reply(int fd, uint8_t* work, bool written) {
+// Neither Reset (the lost command may have been one, and its late reply would
+// pass for the new one's) nor anything that changes state: Read Local Version
+// Information, whose reply can only come after everything sent before it.
+static bool sync_link(int fd, const char* caller) {
+    LOGI("%s: a command went unanswered, so its reply may still come: syncing with Read Local "
+         "Version Information (0x%04x) first", caller, kSyncOpcode);
+    uint8_t buf[WORK_BUF_SIZE];
+    const uint8_t sync[] = {H4_TYPE_COMMAND, kSyncOpcode & 0xFF, kSyncOpcode >> 8, 0x00};
+    long deadline = hci_clock_ms() + HCI_REPLY_TIMEOUT_MS;
+    if (wait_for_command_credit(fd, buf, deadline, caller) && write_packet(fd, sync, sizeof(sync)) &&
+        read_command_reply(fd, buf, kSyncOpcode, deadline, false) != HCI_NOT_ANSWERED) {
+        out_of_step = false;
+        return true;
+    }
+    // As after the HAL's death: the next procedure opens a new session.
+    LOGE("%s: the controller did not answer the sync either, ending the session", caller);
+    shutdown(fd, SHUT_RDWR);
+    return false;
+}
+
+// Whatever waits arrived before the command could be seen, so it is read and
+// skipped; an out-of-step link is synced, and a withheld credit waited for.
+static bool ready_for_command(int fd, uint8_t* work, long deadline, const char* caller) {
+    return skip_waiting_packets(fd, work, caller) && (!out_of_step || sync_link(fd, caller)) &&
+           wait_for_command_credit(fd, work, deadline, caller);
+}
+
+// Sends the packet framed in work and reads its reply into work.
+static HciReply exchange(int fd, uint8_t* work, int len, const char* caller, const char* sent_line) {
     HciReply reply = {static_cast<uint16_t>(work[1] | (work[2] << 8)), HCI_NOT_ANSWERED};
+    uint8_t scratch[WORK_BUF_SIZE];
+    long deadline = hci_clock_ms() + HCI_REPLY_TIMEOUT_MS;
+    bool written = ready_for_command(fd, scratch, deadline, caller) && write_packet(fd, work, len);
+    LOGI("%s", sent_line);
     memset(work, 0, WORK_BUF_SIZE);
-    if (written) reply.status = read_command_reply(fd, work, reply.opcode);
+    if (written) {
+        reply.status = read_command_reply(fd, work, reply.opcode, deadline, true);
+        if (reply.status == HCI_NOT_ANSWERED) out_of_step = true;
+    }
     LOGI("\n");
     return reply;
 }
@@ -102,10 +110,7 @@ HciReply cmd_rawcmd(int fd, int argc, const char* const* argv) {
 
     uint8_t work[WORK_BUF_SIZE];
     int len = build_packet(work, ogf, ocf, static_cast<uint8_t>(plen), params);
-    drop_stale_input(fd, "cmd_rawcmd");
-    bool written = write_packet(fd, work, len);
-    LOGI("Raw HCI command\n");
-    return read_reply(fd, work, written);
+    return exchange(fd, work, len, "cmd_rawcmd", "Raw HCI command\n");
 }
 
 HciReply hci_cmd_exchange(int fd, uint16_t ogf, uint16_t ocf, uint8_t plen, const char* params) {
@@ -120,10 +125,7 @@ HciReply hci_cmd_exchange(int fd, uint16_t ogf, uint16_t ocf, uint8_t plen, cons
 
     uint8_t work[WORK_BUF_SIZE];
     int len = build_packet(work, ogf, ocf, plen, reinterpret_cast<const uint8_t*>(params));
-    drop_stale_input(fd, "hci_send_cmd_rawcmd");
-    bool written = write_packet(fd, work, len);
-    LOGI("Raw HCI command\n\n");
-    return read_reply(fd, work, written);
+    return exchange(fd, work, len, "hci_send_cmd_rawcmd", "Raw HCI command\n\n");
 }
 
 int hci_send_cmd_rawcmd(int fd, uint16_t ogf, uint16_t ocf, uint8_t plen, char* params) {

@@ -28,20 +28,40 @@ LogCapture g_log;
 // Whatever fits the socket buffer at once: nobody need read for the writes to end.
 const size_t kMaxStream = 32768;
 
-// Reference: events only, each whole; only a Command Complete or Command Status
-// that names the command's opcode and holds a status answers it (Core
-// Specification Vol 4, Part E, 7.7.14-15), and a pending Command Status reads
-// on. Java hears the code when the status is 0x00, and before it LE Test End's
-// Num_Packets (the two bytes after the status) when the event holds them.
+// Reference: every packet is read whole by its own header (Core Specification
+// Vol 4, Part A, 2: command, ACL, SCO, event, ISO); data packets and events
+// without parameters are skipped, and a byte that starts no packet ends the
+// reading. Only a Command Complete or Command Status that names the command's
+// opcode and holds a status answers it (Vol 4, Part E, 7.7.14-15), and a
+// pending Command Status reads on. Java hears the code when the status is
+// 0x00, and before it LE Test End's Num_Packets (the two bytes after the
+// status) when the event holds them.
+size_t reference_header(uint8_t type) {
+    static const size_t kHeaders[] = {0, 3, 4, 3, 2, 4};
+    return type < 6 ? kHeaders[type] : 0;
+}
+
+size_t reference_payload(const Bytes& s, size_t at) {
+    switch (s[at]) {
+        case 2: return s[at + 3] | (s[at + 4] << 8);
+        case 4: return s[at + 2];
+        case 5: return s[at + 3] | ((s[at + 4] & 0x3F) << 8);
+        default: return s[at + 3];
+    }
+}
+
 std::string reference_java(const Bytes& s, int code, uint16_t opcode) {
-    for (size_t at = 0; at + 3 <= s.size() && s[at] == 4 && s[at + 2] > 0;) {
-        uint8_t event = s[at + 1];
-        size_t len = s[at + 2];
-        if (at + 3 + len > s.size()) break;
-        Bytes p(s.begin() + at + 3, s.begin() + at + 3 + len);
-        at += 3 + len;
-        if (len < 4 || (event != 0x0E && event != 0x0F)) continue;
-        bool complete = event == 0x0E;
+    for (size_t at = 0; at < s.size() && reference_header(s[at]) != 0;) {
+        size_t header = reference_header(s[at]);
+        if (at + 1 + header > s.size()) break;
+        size_t len = reference_payload(s, at);
+        if (at + 1 + header + len > s.size()) break;
+        bool event = s[at] == 4 && len > 0;
+        uint8_t code_byte = s[at + 1];
+        Bytes p(s.begin() + at + 1 + header, s.begin() + at + 1 + header + len);
+        at += 1 + header + len;
+        if (!event || len < 4 || (code_byte != 0x0E && code_byte != 0x0F)) continue;
+        bool complete = code_byte == 0x0E;
         if ((complete ? p[1] | (p[2] << 8) : p[2] | (p[3] << 8)) != opcode) continue;
         uint8_t status = complete ? p[3] : p[0];
         if (!complete && status == 0x00) continue;
@@ -72,10 +92,17 @@ class Controller {
         for (;;) {
             std::unique_lock<std::mutex> guard(lock_);
             changed_.wait(guard, [this] { return stream_ != nullptr; });
+            // An earlier input left the link out of step: the library syncs
+            // first, with Read Local Version Information, answered as a
+            // controller would.
             uint8_t header[4];
-            FUZZ_CHECK(recv(fd_, header, 4, MSG_WAITALL) == 4, "no command written");
-            Bytes params(header[3]);
-            if (!params.empty()) recv(fd_, params.data(), params.size(), MSG_WAITALL);
+            do {
+                FUZZ_CHECK(recv(fd_, header, 4, MSG_WAITALL) == 4, "no command written");
+                Bytes params(header[3]);
+                if (!params.empty()) recv(fd_, params.data(), params.size(), MSG_WAITALL);
+                const uint8_t version[] = {0x04, 0x0E, 0x04, 0x01, 0x01, 0x10, 0x00};
+                if (header[1] == 0x01 && header[2] == 0x10) send(fd_, version, sizeof(version), MSG_NOSIGNAL);
+            } while (header[1] == 0x01 && header[2] == 0x10);
             if (!stream_->empty()) send(fd_, stream_->data(), stream_->size(), MSG_NOSIGNAL);
             shutdown(fd_, SHUT_WR);
             stream_ = nullptr;

@@ -86,6 +86,14 @@ TEST_F(EventReaderTest, EachEventIsLoggedAndEndsOrContinuesTheExchange) {
               "[5]", "[4]", "[0]", "\n", "onReceivedTestData() value: 4", kNoVm}},
             {"LE meta ending in ff ff", {0x04, 0x3E, 0x03, 0x01, 0xFF, 0xFF},
              {kOther, "[3e]", "[3]", "[1]", "[ff]", "[ff]", "\n", "onReceivedTestData() value: 65535", kNoVm}},
+            // Data and empty events are legal beside a reply: each is read whole and skipped.
+            {"ACL, SCO, ISO and an empty event before a command complete",
+             {0x02, 0x01, 0x20, 0x02, 0x00, 0x04, 0x04, 0x03, 0x01, 0x00, 0x01, 0x04, 0x05, 0x01, 0x00, 0x01, 0x40,
+              0x09, 0x04, 0xFF, 0x00, 0x04, 0x0E, 0x04, 0x01, 0x03, 0x0C, 0x00},
+             {"read_incoming_events: ACL data packet of 6 bytes skipped",
+              "read_incoming_events: SCO data packet of 4 bytes skipped",
+              "read_incoming_events: ISO data packet of 5 bytes skipped", "Zero len , invalid \n", kOther, "[e]", "[4]",
+              "[1]", "[3]", "[c]", "[0]", "\n", "onReceivedTestData() value: 12", kNoVm}},
     };
     for (const auto& c : cases) {
         log_.clear();
@@ -101,9 +109,10 @@ TEST_F(EventReaderTest, BrokenStreamsFailWithTheirLogLine) {
         Bytes stream;
         std::vector<std::string> lines;
     } cases[] = {
-            {"zero length", {0x04, 0x0E, 0x00}, {"Zero len , invalid \n"}},
-            {"ACL packet", {0x02, 0x01, 0x20, 0x00, 0x00}, {}},
+            {"byte that starts no packet", {0x07, 0x0E, 0x04}, {"read_incoming_events: byte 0x07 starts no HCI packet, "
+                                                               "the stream cannot be followed"}},
             {"end of stream", {}, {}},
+            {"end inside an ACL packet", {0x02, 0x01, 0x20, 0x05, 0x01, 0xAA}, {"read error :size = 265\n"}},
             {"end inside the header", {0x04, 0x0E}, {"read error \n"}},
             {"end inside the parameters", {0x04, 0x0E, 0x04, 0x01}, {"read error :size = 4\n"}},
     };

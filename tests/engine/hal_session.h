@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "tests/support/fake_hal.h"
+#include "engine/hci_cmd.h"
 #include "tests/support/log_capture.h"
 #include "transport/session.h"
 
@@ -40,6 +41,21 @@ inline Bytes commandStatus(uint16_t opcode, uint8_t status) {
     return {0x0F, 0x04, status, 0x01, static_cast<uint8_t>(opcode & 0xFF), static_cast<uint8_t>(opcode >> 8)};
 }
 
+// One packet a scripted controller sends: an event unless a type is given.
+struct Packet {
+    Packet(Bytes event) : type(4), bytes(std::move(event)) {}  // NOLINT(implicit)
+    Packet(uint8_t packetType, Bytes packet) : type(packetType), bytes(std::move(packet)) {}
+    uint8_t type;  // H4 type: 2 ACL, 3 SCO, 4 event
+    Bytes bytes;
+};
+using Packets = std::vector<Packet>;
+
+inline void deliver(FakeHal& hal, const Packet& p) {
+    if (p.type == 2) hal.deliverAcl(p.bytes);
+    else if (p.type == 3) hal.deliverSco(p.bytes);
+    else hal.deliverEvent(p.bytes);
+}
+
 // The HCI commands (without H4 type byte) that reached the HAL, in order.
 inline std::vector<Bytes> commandsSent(FakeHal& hal) {
     std::vector<Bytes> commands;
@@ -50,21 +66,34 @@ inline std::vector<Bytes> commandsSent(FakeHal& hal) {
 }
 
 class HalSessionTest : public ::testing::Test {
-  protected: using Script = std::function<std::vector<Bytes>(const Bytes& command)>;
+  protected: using Script = std::function<Packets(const Bytes& command)>;
 
     void SetUp() override {
         hal_ = new FakeHal();
         hal_->onSend = [this](FakeHal& hal, const SentPacket& packet) {
-            for (const Bytes& event : replyTo(packet.bytes)) hal.deliverEvent(event);
+            for (const Packet& p : replyTo(packet.bytes)) deliver(hal, p);
         };
         hal_->registerDefault();
         log_.clear();
     }
 
     void TearDown() override {
+        leaveLinkInStep();
+        FakeHal::unregisterDefault();
+    }
+
+    // A test that left a command unanswered leaves the link out of step, which
+    // outlives sessions: one answered command on a fresh session syncs it.
+    static void leaveLinkInStep() {
         hidl_client_close_tool_end();
         hidl_client_close();
-        FakeHal::unregisterDefault();
+        android::sp<FakeHal> answering = new FakeHal();
+        answering->onSend = [](FakeHal& hal, const SentPacket& p) { hal.deliverEvent(commandComplete(opcodeOf(p.bytes))); };
+        answering->registerDefault();
+        hidl_client_init();
+        hci_send_cmd_rawcmd(bt_fd, 0x04, 0x0001, 0, nullptr);
+        hidl_client_close_tool_end();
+        hidl_client_close();
     }
 
     // "default" becomes a HAL whose initialisation fails: no session can open.
@@ -79,7 +108,7 @@ class HalSessionTest : public ::testing::Test {
         script_ = std::move(script);
     }
 
-    std::vector<Bytes> replyTo(const Bytes& command) {
+    Packets replyTo(const Bytes& command) {
         std::lock_guard<std::mutex> guard(lock_);
         if (script_) return script_(command);
         return {commandComplete(opcodeOf(command))};

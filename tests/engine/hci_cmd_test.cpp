@@ -12,6 +12,8 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
+#include <chrono>
 #include <string>
 #include <thread>
 #include <vector>
@@ -104,9 +106,9 @@ TEST_F(HciCmdTest, CommandsThatDoNotFitAreNotSent) {
 TEST_F(HciCmdTest, ReplyOrNoneDecidesTheExportedResult) {
     answerWith([](const Bytes& command) {
         uint16_t opcode = opcodeOf(command);
-        if (opcode == 0x0C22) return std::vector<Bytes>{commandStatus(opcode, 0x01)};
-        if (opcode == 0x0C03) return std::vector<Bytes>{};
-        return std::vector<Bytes>{commandComplete(opcode, {0x0C})};
+        if (opcode == 0x0C22) return Packets{commandStatus(opcode, 0x01)};
+        if (opcode == 0x0C03) return Packets{};
+        return Packets{commandComplete(opcode, {0x0C})};
     });
     char off[] = {0};
     EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0022, 1, off), 0);
@@ -115,9 +117,11 @@ TEST_F(HciCmdTest, ReplyOrNoneDecidesTheExportedResult) {
     EXPECT_TRUE(log_.contains(ERROR, "read_incoming_events: timed out after 2000 ms waiting for the packet type, return -1"));
 }
 
-// An outside caller may hand a serial line instead of the socket: what waits
-// on it before the command is dropped, and nothing when nothing waits.
-TEST_F(HciCmdTest, SerialLineDropsOnlyTheStaleBytesThatWait) {
+// An outside caller may hand a serial line instead of the socket. What waits
+// on it came before the command: it is read packet by packet and skipped, so
+// a stale reply of the same opcode is not taken; nothing is read when
+// nothing waits.
+TEST_F(HciCmdTest, SerialLineSkipsThePacketsThatWaitBeforeTheCommand) {
     int controller = posix_openpt(O_RDWR | O_NOCTTY);
     ASSERT_TRUE(controller >= 0 && grantpt(controller) == 0 && unlockpt(controller) == 0);
     int line = open(ptsname(controller), O_RDWR | O_NOCTTY);
@@ -125,22 +129,110 @@ TEST_F(HciCmdTest, SerialLineDropsOnlyTheStaleBytesThatWait) {
     ASSERT_EQ(tcgetattr(line, &raw), 0);
     cfmakeraw(&raw);
     ASSERT_EQ(tcsetattr(line, TCSANOW, &raw), 0);
-    for (size_t stale : {3, 0}) {
+    const Bytes connection = {0x04, 0x03, 0x0B, 0x00, 0x40, 0x00, 1, 2, 3, 4, 5, 6, 0x01, 0x00};
+    const Bytes staleReset = {0x04, 0x0E, 0x04, 0x01, 0x03, 0x0C, 0x00};
+    Bytes both = connection;
+    both.insert(both.end(), staleReset.begin(), staleReset.end());
+    for (const Bytes& stale : {both, Bytes()}) {
         log_.clear();
-        ASSERT_EQ(write(controller, "\x04\x04\x04", stale), static_cast<ssize_t>(stale));
+        writeAll(controller, stale);
         struct pollfd waiting = {line, POLLIN, 0};
-        ASSERT_EQ(poll(&waiting, 1, stale ? 1000 : 0), stale ? 1 : 0);
+        ASSERT_EQ(poll(&waiting, 1, stale.empty() ? 0 : 1000), stale.empty() ? 0 : 1);
         std::thread answer([controller] {
             EXPECT_EQ(readBytes(controller, 4, 1000), (Bytes{0x01, 0x03, 0x0C, 0x00}));
-            EXPECT_EQ(write(controller, "\x04\x0e\x04\x01\x03\x0c\x00", 7), 7);
+            EXPECT_EQ(write(controller, "\x04\x0e\x04\x01\x03\x0c\x0c", 7), 7);
         });
-        EXPECT_EQ(hci_send_cmd_rawcmd(line, 0x03, 0x0003, 0, nullptr), 0);
+        EXPECT_EQ(hci_cmd_exchange(line, 0x03, 0x0003, 0, nullptr).status, 0x0C);
         answer.join();
-        EXPECT_EQ(log_.containsFragment("stale bytes"), stale > 0);
-        EXPECT_EQ(log_.count(INFO, "hci_send_cmd_rawcmd: dropped 3 stale bytes before the command"), stale ? 1 : 0);
+        EXPECT_EQ(log_.containsFragment("came before the command"), !stale.empty());
+        EXPECT_EQ(log_.count(INFO, "CONNECTION COMPLETE EVENT RECEIVED WITH HANDLE: 0x0040 \n"), stale.empty() ? 0 : 1);
+        EXPECT_EQ(log_.count(INFO, "hci_send_cmd_rawcmd: event 0xe came before the command, skipped"), stale.empty() ? 0 : 1);
     }
     close(line);
     close(controller);
+}
+
+const Bytes kSync = {0x01, 0x10, 0x00};
+const Bytes kReset = {0x03, 0x0C, 0x00};
+const std::string kSyncLine = "hci_send_cmd_rawcmd: a command went unanswered, so its reply may still come: syncing "
+                              "with Read Local Version Information (0x1001) first";
+
+// HCI replies carry no sequence number. A controller that answered a Reset
+// only after the library gave up sends that late reply with the next
+// command's; without a sync it would pass for the next Reset's reply.
+TEST_F(HciCmdTest, UnansweredCommandIsFollowedByASyncBeforeTheNextOne) {
+    int commands = 0;
+    answerWith([&commands](const Bytes& command) {
+        uint16_t opcode = opcodeOf(command);
+        if (++commands == 1) return Packets{};
+        Bytes own = commandComplete(opcode, {static_cast<uint8_t>(opcode == 0x1001 ? 0x00 : 0x0C)});
+        return commands == 2 ? Packets{commandComplete(0x0C03), own} : Packets{own};
+    });
+    EXPECT_EQ(hci_cmd_exchange(bt_fd, 0x03, 0x0003, 0, nullptr).status, HCI_NOT_ANSWERED);
+    EXPECT_EQ(hci_cmd_exchange(bt_fd, 0x03, 0x0003, 0, nullptr).status, 0x0C);
+    EXPECT_EQ(commandsSent(*hal_), (std::vector<Bytes>{kReset, kSync, kReset}));
+    EXPECT_EQ(log_.count(INFO, kSyncLine), 1);
+    EXPECT_TRUE(log_.contains(INFO, "read_incoming_events: event 0xe does not answer opcode 0x1001, skipped"));
+    EXPECT_EQ(hci_cmd_exchange(bt_fd, 0x03, 0x0003, 0, nullptr).status, 0x0C);
+    EXPECT_EQ(commandsSent(*hal_).size(), 4u) << "in step again: no second sync";
+}
+
+// A sync that goes unanswered too ends the session, as the HAL's death does;
+// the link stays out of step on the next session, which syncs first.
+TEST_F(HciCmdTest, UnansweredSyncEndsTheSessionAndTheNextSessionSyncs) {
+    answerWith([](const Bytes&) { return Packets{}; });
+    EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0003, 0, nullptr), -1);
+    EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0003, 0, nullptr), -1);
+    EXPECT_TRUE(log_.contains(ERROR, "hci_send_cmd_rawcmd: the controller did not answer the sync either, ending the session"));
+    char byte;
+    EXPECT_EQ(recv(bt_fd, &byte, 1, MSG_DONTWAIT), 0) << "the session's stream has ended";
+    EXPECT_EQ(commandsSent(*hal_), (std::vector<Bytes>{kReset, kSync}));
+
+    answerWith(nullptr);
+    hidl_client_close_tool_end();
+    hidl_client_close();
+    hidl_client_init();
+    EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0003, 0, nullptr), 0);
+    EXPECT_EQ(commandsSent(*hal_), (std::vector<Bytes>{kReset, kSync, kSync, kReset}));
+}
+
+// A reply with Num_HCI_Command_Packets 0 takes the controller's credit: the
+// next command waits for an event that gives one back (here the no-op Command
+// Complete of opcode 0x0000), and is not sent when none comes. A new session
+// starts with a credit.
+TEST_F(HciCmdTest, CommandWaitsForTheControllersCredit) {
+    std::atomic<bool> granted{false};
+    std::atomic<bool> sentBeforeCredit{false};
+    std::vector<std::thread> late;
+    answerWith([&](const Bytes& command) {
+        uint16_t opcode = opcodeOf(command);
+        if (opcode == 0x0C03) sentBeforeCredit = sentBeforeCredit || !granted;
+        Bytes reply = commandComplete(opcode);
+        reply[2] = 0x00;  // no credit
+        if (opcode == 0x0C1A) {
+            late.emplace_back([this, &granted] {
+                std::this_thread::sleep_for(std::chrono::milliseconds(200));
+                granted = true;
+                hal_->deliverEvent({0x0E, 0x03, 0x01, 0x00, 0x00});
+            });
+        }
+        return Packets{reply};
+    });
+    char scan[] = {0x03};
+    EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x001A, 1, scan), 0);
+    EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0003, 0, nullptr), 0);
+    for (auto& t : late) t.join();
+    EXPECT_FALSE(sentBeforeCredit);
+    EXPECT_EQ(commandsSent(*hal_).size(), 2u);
+
+    EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0003, 0, nullptr), -1);  // the Reset's reply gave none back
+    EXPECT_TRUE(log_.contains(ERROR, "hci_send_cmd_rawcmd: no command credit from the controller within 2000 ms, command not sent"));
+    EXPECT_EQ(commandsSent(*hal_).size(), 2u);
+    answerWith(nullptr);
+    hidl_client_close_tool_end();
+    hidl_client_close();
+    hidl_client_init();
+    EXPECT_EQ(hci_send_cmd_rawcmd(bt_fd, 0x03, 0x0003, 0, nullptr), 0);
 }
 
 // With SIGPIPE at its default action, a write that raised it would end the

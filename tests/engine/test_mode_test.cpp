@@ -32,8 +32,10 @@ class TestModeTest : public HalSessionTest {
 };
 
 Bytes event(uint8_t code, const Bytes& params) {
-    Bytes e = {code, static_cast<uint8_t>(params.size())};
-    e.insert(e.end(), params.begin(), params.end());
+    Bytes e(2 + params.size());  // sized first, as commandComplete is
+    e[0] = code;
+    e[1] = static_cast<uint8_t>(params.size());
+    std::copy(params.begin(), params.end(), e.begin() + 2);
     return e;
 }
 
@@ -77,11 +79,17 @@ const Bytes kCompletedPackets = event(0x13, {0x01, 0x40, 0x00, 0x2A, 0x00});
 const Bytes kConnection = event(0x03, {0x00, 0x40, 0x00, 1, 2, 3, 4, 5, 6, 0x01, 0x00});
 const Bytes kDisconnection = event(0x05, {0x00, 0x40, 0x00, 0x13});
 const Bytes kInquiryComplete = event(0x01, {0x00});
+const Packet kSco(3, {0x01, 0x00, 0x02, 0x0E, 0x0E});
+const Packet kAcl(2, [] {
+    Bytes acl = {0x01, 0x20, 0x2C, 0x01};  // 300 bytes of data that look like replies
+    for (int i = 0; i < 300; ++i) acl.push_back(i % 2 ? 0x0E : 0x04);
+    return acl;
+}());
 
 struct ReplyCase {
     const char* name;
     int code;
-    std::vector<Bytes> reply;  // what the controller sends after the command
+    Packets reply;  // what the controller sends after the command
     std::string java;          // the callbacks that must reach Java, in order
     std::string line;          // a line that must be logged at error priority, if any
 };
@@ -113,9 +121,17 @@ TEST_F(TestModeTest, OnlyTheCommandsOwnAcceptedReplyReachesJava) {
              "received 42,success 3000", ""},
             {"only other events", 3000, {kLeMeta, commandComplete(0x201D, {0x00, 0x2A, 0x00})}, "",
              "sendBleTestCommand, command 3000 not answered return!!!"},
+            // Legal traffic beside a reply: data packets, longer than the reply buffer too,
+            // and an event without parameters.
+            {"data and empty events beside the replies", 3000,
+             {kAcl, kSco, event(0xFF, {}), commandStatus(0x201F, 0x00), kAcl, commandComplete(0x201F, {0x00, 0x2A, 0x00})},
+             "received 42,success 3000", ""},
     };
     for (const ReplyCase& c : cases) {
-        answerWith([&c](const Bytes&) { return c.reply; });
+        // After an unanswered row the library syncs first: the controller answers that too.
+        answerWith([&c](const Bytes& command) {
+            return opcodeOf(command) == 0x1001 ? Packets{commandComplete(0x1001)} : c.reply;
+        });
         log_.clear();
         sendBleTestCommand(c.code, c.code == 22440 ? 1 : 0);
         EXPECT_EQ(takeJavaCalls(), c.java) << c.name;
@@ -144,7 +160,7 @@ TEST_F(TestModeTest, UnknownCodeOrNoSessionSendsNothingAndReportsNothing) {
 TEST_F(TestModeTest, TestEndThatOpensTheSessionReportsNoCount) {
     ASSERT_EQ(bt_fd, -1);
     answerWith([](const Bytes& command) {
-        return std::vector<Bytes>{commandComplete(opcodeOf(command), {0x00, 0x2A, 0x00})};
+        return Packets{commandComplete(opcodeOf(command), {0x00, 0x2A, 0x00})};
     });
     sendBleTestCommand(3000, 0);
     EXPECT_EQ(commandsSent(*hal_).back(), (Bytes{0x1F, 0x20, 0x00}));
@@ -184,7 +200,7 @@ TEST_F(TestModeTest, DeviceUnderTestEntryIsAllOrNothing) {
     for (const auto& c : cases) {
         answerWith([&c](const Bytes& command) {
             uint16_t opcode = opcodeOf(command);
-            return std::vector<Bytes>{opcode == c.opcode ? c.refusal : commandComplete(opcode)};
+            return Packets{opcode == c.opcode ? c.refusal : commandComplete(opcode)};
         });
         size_t before = commandsSent(*hal_).size();
         int closes = hal_->closeCalls();
@@ -237,7 +253,7 @@ TEST_F(TestModeTest, QuitAndDestroyEachEndTheSessionOnce) {
 TEST_F(TestModeTest, ContinuousWaveCommandCarriesChannelPowerAndType) {
     answerWith([](const Bytes& command) {
         uint8_t status = command[4] == 0xFF ? 0x12 : 0x00;  // a vendor refusing channel 255
-        return std::vector<Bytes>{commandComplete(opcodeOf(command), {status})};
+        return Packets{commandComplete(opcodeOf(command), {status})};
     });
     sendCwtxCommandNative(nullptr, nullptr, 1, 9, 4);
     sendCwtxCommandNative(nullptr, nullptr, 255, 0, 255);

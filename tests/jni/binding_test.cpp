@@ -67,7 +67,7 @@ TEST_F(BindingTest, CountIsReportedOnceAndAFlagClearMeansNoCall) {
 TEST_F(BindingTest, ThrowingCallbacksAreClearedAndTheLibraryGoesOn) {
     bindFakeJava();
     answerWith([](const Bytes& command) {
-        return std::vector<Bytes>{commandComplete(opcodeOf(command), {0x00, 0x2A, 0x00})};
+        return Packets{commandComplete(opcodeOf(command), {0x00, 0x2A, 0x00})};
     });
     sendBleTestCommand(22440, 0);
     setJavaThrows(true);
