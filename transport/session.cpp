@@ -81,8 +81,14 @@ void end_init_wait_locked(bool ready) {
 }
 
 // Type byte and packet go out in one locked write: packets from callbacks on
-// several HAL threads never interleave in the stream.
+// several HAL threads never interleave in the stream. A packet whose size
+// disagrees with its own header would shift every packet after it, so it is
+// dropped.
 void write_to_tool(uint8_t type, const hidl_vec<uint8_t>& packet, const char* callback) {
+    if (!h4_packet_agrees(type, packet.data(), packet.size())) {
+        LOGE("%s: packet of %zu bytes disagrees with its header, dropped", callback, packet.size());
+        return;
+    }
     std::vector<unsigned char> h4(packet.size() + 1);
     h4[0] = type;
     if (packet.size() > 0) memcpy(h4.data() + 1, packet.data(), packet.size());

@@ -72,6 +72,38 @@ TEST_F(SessionTest, OpeningHandsOutTheToolEndAndCallbacksWriteTypedPackets) {
               readBytes(bt_fd, 18));
 }
 
+// A packet whose size disagrees with its own header would shift every packet
+// after it in the stream: it is dropped, and the next one arrives intact.
+TEST_F(SessionTest, CallbackPacketThatDisagreesWithItsHeaderIsDropped) {
+    sp<FakeHal> hal = installHal();
+    hidl_client_init();
+    ASSERT_GE(bt_fd, 0);
+    const struct {
+        uint8_t type;
+        Bytes packet;
+        const char* callback;
+    } cases[] = {
+            {4, {0x0E, 0x06, 0x01, 0x03, 0x0C, 0x00}, "hciEventReceived"},        // says 6, holds 4
+            {4, {0x0E, 0x03, 0x01, 0x03, 0x0C, 0x00}, "hciEventReceived"},        // says 3, holds 4
+            {4, {}, "hciEventReceived"},
+            {2, {0x01, 0x20, 0x05, 0x00, 0xAA}, "aclDataReceived"},
+            {2, {0x01, 0x20, 0x01}, "aclDataReceived"},
+            {3, {0x01, 0x00, 0x01}, "scoDataReceived"},
+    };
+    const Bytes good = {0x0E, 0x04, 0x01, 0x03, 0x0C, 0x00};
+    for (const auto& c : cases) {
+        log.clear();
+        if (c.type == 4) hal->deliverEvent(c.packet);
+        if (c.type == 2) hal->deliverAcl(c.packet);
+        if (c.type == 3) hal->deliverSco(c.packet);
+        hal->deliverEvent(good);
+        EXPECT_EQ((Bytes{0x04, 0x0E, 0x04, 0x01, 0x03, 0x0C, 0x00}), readBytes(bt_fd, 7)) << c.callback;
+        EXPECT_TRUE(log.contains(ERROR, std::string(c.callback) + ": packet of " + std::to_string(c.packet.size()) +
+                                                " bytes disagrees with its header, dropped")) << c.callback;
+    }
+    EXPECT_TRUE(staysQuiet(bt_fd, 50));
+}
+
 // A failed opening leaves nothing open: no session, and no initialised HAL.
 TEST_F(SessionTest, FailedOpeningsLeaveNoSessionAndNoHal) {
     for (auto mode : {FakeHal::InitMode::Sync, FakeHal::InitMode::Async}) {  // answered on either thread
