@@ -249,9 +249,24 @@ int read_command_reply(int fd, uint8_t* buf, uint16_t opcode, long deadline, boo
     }
 }
 
+// Whether a byte waits on fd now, without taking it: the common case before a
+// command is that nothing does, and it costs one call.
+static bool byte_waiting(int fd) {
+    uint8_t byte;
+    ssize_t n;
+    while ((n = recv(fd, &byte, 1, MSG_PEEK | MSG_DONTWAIT)) == -1 && errno == EINTR) {
+    }
+    if (n == -1 && errno == ENOTSOCK) {
+        struct pollfd pfd = {fd, POLLIN, 0};
+        return poll(&pfd, 1, 0) == 1;
+    }
+    return n != -1 || (errno != EAGAIN && errno != EWOULDBLOCK);  // an end or an error is read next
+}
+
 // A controller flooding the stream cannot hold the command back for longer
 // than one reply time-out.
 bool skip_waiting_packets(int fd, uint8_t* buf, const char* caller) {
+    if (!byte_waiting(fd)) return true;
     long give_up = hci_clock_ms() + HCI_REPLY_TIMEOUT_MS;
     for (long now = hci_clock_ms(); now < give_up; now = hci_clock_ms()) {
         PacketRead read = next_packet(fd, buf, now, now + HCI_REPLY_TIMEOUT_MS);
@@ -261,7 +276,7 @@ bool skip_waiting_packets(int fd, uint8_t* buf, const char* caller) {
         }
         if (read == PACKET_ENDED || read == PACKET_LOST) {
             end_lost_stream(fd, read);
-            return read == PACKET_ENDED;  // an ended stream fails the write instead
+            return false;
         }
     }
     return true;

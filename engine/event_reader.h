@@ -34,8 +34,8 @@ long hci_clock_ms();
 // that cannot be followed any more is shut down (logged), ending the session.
 int read_command_reply(int fd, uint8_t* buf, uint16_t opcode, long deadline, bool up_call);
 // Reads and logs as skipped every packet already waiting on fd: it came
-// before the next command could have been seen. False (logged, the stream
-// shut down) when the stream cannot be followed.
+// before the next command could have been seen. False when the stream has
+// ended, or cannot be followed (logged, the stream shut down).
 bool skip_waiting_packets(int fd, uint8_t* buf, const char* caller);
 // True at once unless the controller's last Command Complete or Command
 // Status withheld its command credit (Num_HCI_Command_Packets 0) on this
