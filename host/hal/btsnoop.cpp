@@ -10,8 +10,10 @@
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/time.h>
+#include <time.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <vector>
 
 #include "host/hal/h4_stream.h"
@@ -67,48 +69,74 @@ int Btsnoop::openFile(const std::string& path) {
     return fd;
 }
 
-std::shared_ptr<Btsnoop> Btsnoop::open(const std::string& path) {
+std::shared_ptr<Btsnoop> Btsnoop::open(const std::string& path, bool steady) {
     int fd = openFile(path);
     if (fd == -1) return nullptr;
-    return std::shared_ptr<Btsnoop>(new Btsnoop({fd}));
+    return std::shared_ptr<Btsnoop>(new Btsnoop({{fd, steady}}));
 }
 
 std::shared_ptr<Btsnoop> Btsnoop::fromEnvironment() {
-    std::vector<int> fds;
+    std::vector<File> files;
     for (const char* name : {"HALVENOR_BTSNOOP", "HALVENOR_CONSOLE_CAPTURE"}) {
         const char* path = getenv(name);
         if (path == nullptr || path[0] == '\0') continue;
         int fd = openFile(path);
-        if (fd != -1) fds.push_back(fd);
+        if (fd != -1) files.push_back({fd, strcmp(name, "HALVENOR_CONSOLE_CAPTURE") == 0});
     }
-    if (fds.empty()) return nullptr;
-    return std::shared_ptr<Btsnoop>(new Btsnoop(std::move(fds)));
+    if (files.empty()) return nullptr;
+    return std::shared_ptr<Btsnoop>(new Btsnoop(std::move(files)));
 }
 
 Btsnoop::~Btsnoop() {
-    for (int fd : fds_) close(fd);
+    for (const File& f : files_) close(f.fd);
 }
 
-void Btsnoop::record(uint8_t type, const uint8_t* packet, size_t len, bool received) {
+static int64_t system_wall_clock() {
     struct timeval tv;
     gettimeofday(&tv, nullptr);
-    uint64_t micros = static_cast<uint64_t>(tv.tv_sec) * 1000000ULL + tv.tv_usec + kBtsnoopEpochDelta;
+    return static_cast<int64_t>(tv.tv_sec) * 1000000 + tv.tv_usec;
+}
+
+static int64_t monotonic_us() {
+    struct timespec ts;
+    clock_gettime(CLOCK_MONOTONIC, &ts);
+    return static_cast<int64_t>(ts.tv_sec) * 1000000 + ts.tv_nsec / 1000;
+}
+
+static std::atomic<Btsnoop::WallClock> wall_clock{system_wall_clock};
+
+void Btsnoop::useWallClock(WallClock clock) { wall_clock = clock != nullptr ? clock : system_wall_clock; }
+
+// The steady stamps of the whole process count from one reading of both clocks.
+static int64_t steady_now_us() {
+    static const int64_t wall_at_start = wall_clock.load()();
+    static const int64_t monotonic_at_start = monotonic_us();
+    return wall_at_start + (monotonic_us() - monotonic_at_start);
+}
+
+static std::vector<uint8_t> snoop_record(uint8_t type, const uint8_t* packet, size_t len, bool received,
+                                         int64_t micros) {
     // Flags: bit 0 direction (1 = received by the host), bit 1 command or event.
     uint32_t flags = (received ? 1u : 0u) | (type == H4_TYPE_COMMAND || type == H4_TYPE_EVENT ? 2u : 0u);
     uint32_t length = static_cast<uint32_t>(len + 1);
-
     std::vector<uint8_t> rec;
     rec.reserve(24 + length);
     put32(rec, length);  // original length
     put32(rec, length);  // included length
     put32(rec, flags);
     put32(rec, 0);  // cumulative drops
-    put64(rec, micros);
+    put64(rec, static_cast<uint64_t>(micros) + kBtsnoopEpochDelta);
     rec.push_back(type);
     rec.insert(rec.end(), packet, packet + len);
+    return rec;
+}
 
+void Btsnoop::record(uint8_t type, const uint8_t* packet, size_t len, bool received) {
+    int64_t wall = wall_clock.load()();
+    int64_t steady = steady_now_us();
     std::lock_guard<std::mutex> guard(lock_);
-    for (int fd : fds_) {
-        if (!write_all(fd, rec)) HLOGE("btsnoop: write failed: %s", strerror(errno));
+    for (const File& f : files_) {
+        std::vector<uint8_t> rec = snoop_record(type, packet, len, received, f.steady ? steady : wall);
+        if (!write_all(f.fd, rec)) HLOGE("btsnoop: write failed: %s", strerror(errno));
     }
 }

@@ -33,24 +33,31 @@ std::string env_or(const char* name, const char* fallback) {
     return value != nullptr && value[0] != '\0' ? value : fallback;
 }
 
-bool parse_fraction(const std::string& text, double* out) {
+// A decimal number from 0 to max.
+bool parse_range(const std::string& text, double max, double* out) {
     char* end = nullptr;
     double v = strtod(text.c_str(), &end);
-    if (end == text.c_str() || *end != '\0' || !(v >= 0.0 && v <= 1.0)) return false;
+    if (end == text.c_str() || *end != '\0' || !(v >= 0.0 && v <= max)) return false;
     *out = v;
     return true;
 }
 
-// HALVENOR_SIM_REFTX (1 on, 0 off; default on) and HALVENOR_SIM_LOSS (0..1).
+// HALVENOR_SIM_REFTX (1 on, 0 off; default on), HALVENOR_SIM_LOSS (0..1) and
+// HALVENOR_SIM_DELAY (seconds, 0..10).
 bool sim_settings(SimControllerSettings* settings) {
     std::string reftx = env_or("HALVENOR_SIM_REFTX", "1");
     std::string loss = env_or("HALVENOR_SIM_LOSS", "0");
+    std::string delay = env_or("HALVENOR_SIM_DELAY", "0");
     if (reftx != "0" && reftx != "1") {
         HLOGE("HALVENOR_SIM_REFTX=\"%s\": expected 0 or 1", reftx.c_str());
         return false;
     }
-    if (!parse_fraction(loss, &settings->loss)) {
+    if (!parse_range(loss, 1, &settings->loss)) {
         HLOGE("HALVENOR_SIM_LOSS=\"%s\": expected a fraction from 0 to 1", loss.c_str());
+        return false;
+    }
+    if (!parse_range(delay, 10, &settings->delay_s)) {
+        HLOGE("HALVENOR_SIM_DELAY=\"%s\": expected seconds from 0 to 10", delay.c_str());
         return false;
     }
     settings->reference_tx = reftx == "1";

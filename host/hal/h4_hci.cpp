@@ -4,21 +4,14 @@
 #include "host/hal/h4_hci.h"
 
 #include <errno.h>
-#include <fcntl.h>
-#include <netdb.h>
-#include <netinet/in.h>
-#include <netinet/tcp.h>
 #include <poll.h>
 #include <string.h>
 #include <sys/eventfd.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <termios.h>
 #include <unistd.h>
 
 #include <atomic>
-#include <chrono>
-#include <cstdlib>
 #include <memory>
 #include <mutex>
 #include <thread>
@@ -29,196 +22,9 @@
 #include "host/hal/host_hci.h"
 #include "host/hal/host_log.h"
 
-// A controller that has not answered a connect by then is not coming.
-static const int kConnectTimeoutMs = 3000;
-
-struct BaudRow {
-    int baud;
-    speed_t speed;
-};
-static const BaudRow kBauds[] = {
-        {9600, B9600},       {19200, B19200},     {38400, B38400},     {57600, B57600},
-        {115200, B115200},   {230400, B230400},   {460800, B460800},   {500000, B500000},
-        {921600, B921600},   {1000000, B1000000}, {1500000, B1500000}, {2000000, B2000000},
-        {3000000, B3000000}, {4000000, B4000000}, {0, B0},
-};
-
-static bool baud_speed(int baud, speed_t* speed) {
-    for (const BaudRow* row = kBauds; row->baud != 0; ++row) {
-        if (row->baud == baud) {
-            *speed = row->speed;
-            return true;
-        }
-    }
-    return false;
-}
-
-// A whole decimal number in 1..max, else -1.
-static long parse_number(const std::string& text, long max) {
-    if (text.empty() || text.find_first_not_of("0123456789") != std::string::npos) return -1;
-    if (text.size() > 9) return -1;
-    long n = strtol(text.c_str(), nullptr, 10);
-    return n >= 1 && n <= max ? n : -1;
-}
-
-// "DEVICE[,BAUD][,rtscts]": many UART boards need RTS/CTS to keep up.
-static bool parse_tty(const std::string& rest, H4Target* t, std::string* why) {
-    size_t comma = rest.find(',');
-    t->path = rest.substr(0, comma);
-    if (t->path.empty()) return *why = "no device after tty:", false;
-    while (comma != std::string::npos) {
-        size_t next = rest.find(',', comma + 1);
-        std::string field = rest.substr(comma + 1, next == std::string::npos ? std::string::npos : next - comma - 1);
-        comma = next;
-        if (field == "rtscts") {
-            t->rtscts = true;
-            continue;
-        }
-        long baud = parse_number(field, 4000000);
-        speed_t speed;
-        if (baud < 0 || !baud_speed(static_cast<int>(baud), &speed)) {
-            return *why = "baud rate " + field + " is not a standard speed (9600 to 4000000)", false;
-        }
-        t->baud = static_cast<int>(baud);
-    }
-    return true;
-}
-
-static bool parse_tcp(const std::string& rest, H4Target* t, std::string* why) {
-    size_t colon = rest.rfind(':');
-    if (colon == std::string::npos || colon == 0) return *why = "expected tcp:HOST:PORT", false;
-    t->path = rest.substr(0, colon);
-    long port = parse_number(rest.substr(colon + 1), 65535);
-    if (port < 0) return *why = "port '" + rest.substr(colon + 1) + "' is not in 1..65535", false;
-    t->port = static_cast<int>(port);
-    return true;
-}
-
-bool parse_h4_target(const std::string& value, H4Target* t, std::string* why) {
-    t->text = value;
-    size_t colon = value.find(':');
-    std::string kind = value.substr(0, colon);
-    std::string rest = colon == std::string::npos ? "" : value.substr(colon + 1);
-    if (colon != std::string::npos && kind == "unix") {
-        t->kind = H4Target::UNIX;
-        t->path = rest;
-        if (rest.empty()) return *why = "no path after unix:", false;
-        if (rest.size() >= sizeof(sockaddr_un::sun_path)) return *why = "socket path too long", false;
-        return true;
-    }
-    if (colon != std::string::npos && kind == "tcp") {
-        t->kind = H4Target::TCP;
-        return parse_tcp(rest, t, why);
-    }
-    if (colon != std::string::npos && kind == "tty") {
-        t->kind = H4Target::TTY;
-        return parse_tty(rest, t, why);
-    }
-    *why = "expected sim, none, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]";
-    return false;
-}
-
-// Waits for `events` on fd or for the wake descriptor; false on time-out,
-// wake-up or error (with *why set).
-static bool wait_for(int fd, short events, int wake, int timeout_ms, std::string* why) {
-    struct pollfd pfds[2] = {{fd, events, 0}, {wake, POLLIN, 0}};
-    int rc;
-    while ((rc = poll(pfds, 2, timeout_ms)) == -1 && errno == EINTR) {
-    }
-    if (rc == 0) return *why = "no answer within " + std::to_string(timeout_ms) + " ms", false;
-    if (rc < 0) return *why = std::string("poll: ") + strerror(errno), false;
-    if (pfds[1].revents != 0) return *why = "closed while connecting", false;
-    return true;
-}
-
-// Non-blocking connect bounded by the time-out, then back to blocking I/O.
-static int connect_bounded(int fd, const sockaddr* addr, socklen_t len, int wake, std::string* why) {
-    fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK);
-    if (connect(fd, addr, len) == -1) {
-        if (errno != EINPROGRESS) return *why = std::string("connect: ") + strerror(errno), -1;
-        if (!wait_for(fd, POLLOUT, wake, kConnectTimeoutMs, why)) return -1;
-        int err = 0;
-        socklen_t err_len = sizeof(err);
-        getsockopt(fd, SOL_SOCKET, SO_ERROR, &err, &err_len);
-        if (err != 0) return *why = std::string("connect: ") + strerror(err), -1;
-    }
-    fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) & ~O_NONBLOCK);
-    return fd;
-}
-
-static int connect_unix(const H4Target& t, int wake, std::string* why) {
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (fd == -1) return *why = std::string("socket: ") + strerror(errno), -1;
-    struct sockaddr_un addr = {};
-    addr.sun_family = AF_UNIX;
-    memcpy(addr.sun_path, t.path.c_str(), t.path.size());
-    if (connect_bounded(fd, reinterpret_cast<sockaddr*>(&addr), sizeof(addr), wake, why) == -1) {
-        close(fd);
-        return -1;
-    }
-    return fd;
-}
-
-static int connect_tcp(const H4Target& t, int wake, std::string* why) {
-    struct addrinfo hints = {};
-    hints.ai_family = AF_UNSPEC;
-    hints.ai_socktype = SOCK_STREAM;
-    hints.ai_flags = AI_NUMERICSERV;
-    struct addrinfo* found = nullptr;
-    int rc = getaddrinfo(t.path.c_str(), std::to_string(t.port).c_str(), &hints, &found);
-    if (rc != 0) return *why = std::string("host: ") + gai_strerror(rc), -1;
-    int fd = -1;
-    for (struct addrinfo* ai = found; ai != nullptr && fd == -1; ai = ai->ai_next) {
-        fd = socket(ai->ai_family, ai->ai_socktype | SOCK_CLOEXEC, ai->ai_protocol);
-        if (fd == -1) continue;
-        if (connect_bounded(fd, ai->ai_addr, ai->ai_addrlen, wake, why) == -1) {
-            close(fd);
-            fd = -1;
-        }
-    }
-    freeaddrinfo(found);
-    if (fd == -1) return -1;
-    int one = 1;
-    setsockopt(fd, IPPROTO_TCP, TCP_NODELAY, &one, sizeof(one));  // commands are tiny
-    return fd;
-}
-
-// Raw 8N1 at the requested speed, with RTS/CTS only when asked for.
-static int open_tty(const H4Target& t, std::string* why) {
-    int fd = open(t.path.c_str(), O_RDWR | O_NOCTTY | O_NONBLOCK | O_CLOEXEC);
-    if (fd == -1) return *why = std::string("open: ") + strerror(errno), -1;
-    struct termios tio;
-    speed_t speed = B115200;
-    baud_speed(t.baud, &speed);
-    if (tcgetattr(fd, &tio) == -1) {
-        *why = errno == ENOTTY ? std::string("not a serial line") : std::string("tcgetattr: ") + strerror(errno);
-        close(fd);
-        return -1;
-    }
-    cfmakeraw(&tio);
-    tio.c_cflag |= CLOCAL | CREAD;
-    if (t.rtscts) tio.c_cflag |= CRTSCTS;
-    else tio.c_cflag &= ~CRTSCTS;
-    cfsetispeed(&tio, speed);
-    cfsetospeed(&tio, speed);
-    if (tcsetattr(fd, TCSANOW, &tio) == -1) {
-        *why = std::string("tcsetattr: ") + strerror(errno);
-        close(fd);
-        return -1;
-    }
-    tcflush(fd, TCIFLUSH);
-    fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) & ~O_NONBLOCK);
-    return fd;
-}
-
-static int connect_target(const H4Target& t, int wake, std::string* why) {
-    switch (t.kind) {
-        case H4Target::UNIX: return connect_unix(t, wake, why);
-        case H4Target::TCP: return connect_tcp(t, wake, why);
-        case H4Target::TTY: return open_tty(t, why);
-    }
-    return -1;
-}
+// A controller that takes no byte of a packet for this long is stuck: the
+// library's own reply time-out.
+static const int kWriteTimeoutMs = 2000;
 
 namespace {
 
@@ -236,6 +42,7 @@ class H4Hci final : public HostHci {
     void deliver(const H4Packet& packet);
     void endSession(int fd);
     Return<void> send(uint8_t type, const hidl_vec<uint8_t>& packet) override;
+    void logSendFailure(int fd);
     void stop() override;
 
     const H4Target target_;
@@ -271,7 +78,7 @@ Return<void> H4Hci::initialize(const sp<IBluetoothHciCallbacks>& callback) {
 
 void H4Hci::readerMain() {
     std::string why;
-    int fd = connect_target(target_, wake_, &why);
+    int fd = connect_h4_target(target_, wake_, &why);
     if (fd == -1) {
         HLOGE("h4: cannot reach %s: %s", target_.text.c_str(), why.c_str());
         callbacks_->initializationComplete(Status::INITIALIZATION_ERROR);
@@ -302,9 +109,9 @@ void H4Hci::readLoop(int fd) {
     uint8_t buf[4096];
     auto sink = [this](const H4Packet& packet) { deliver(packet); };
     std::string why;
-    while (wait_for(fd, POLLIN, wake_, -1, &why)) {
+    while (h4_wait_for(fd, POLLIN, wake_, -1, &why)) {
         ssize_t n = read(fd, buf, sizeof(buf));
-        if (n < 0 && errno == EINTR) continue;
+        if (n < 0 && (errno == EINTR || errno == EAGAIN)) continue;
         if (n <= 0 && closing_.load()) return;
         if (n <= 0) {
             if (n == 0) {
@@ -336,7 +143,9 @@ void H4Hci::deliver(const H4Packet& packet) {
         case H4_TYPE_EVENT: callbacks_->hciEventReceived(bytes); break;
         case H4_TYPE_ACL: callbacks_->aclDataReceived(bytes); break;
         case H4_TYPE_SCO: callbacks_->scoDataReceived(bytes); break;
-        default: HLOGE("h4: command packet from the controller %s dropped", target_.text.c_str());
+        default:
+            HLOGE("h4: %s packet from the controller %s dropped: the HAL has no way to deliver it",
+                  h4_type_name(packet.type), target_.text.c_str());
     }
 }
 
@@ -358,12 +167,25 @@ Return<void> H4Hci::send(uint8_t type, const hidl_vec<uint8_t>& packet) {
     // Captured before the write: the controller's answer may be read, and
     // captured, before a write returns.
     if (snoop) snoop->record(type, packet.data(), packet.size(), false);
-    if (!h4_send(fd, type, packet.data(), packet.size(), -1)) {
-        HLOGE("h4: %s: connection lost: %s", target_.text.c_str(), strerror(errno));
+    if (!h4_send(fd, type, packet.data(), packet.size(), kWriteTimeoutMs)) {
+        logSendFailure(fd);
         endSession(fd);
         return deadObject();
     }
     return Void();
+}
+
+// A stuck write leaves its bytes queued: they are thrown away at once, so that
+// neither a later write nor closing the line waits for a controller that has
+// stopped taking them.
+void H4Hci::logSendFailure(int fd) {
+    if (errno != ETIMEDOUT) {
+        HLOGE("h4: %s: connection lost: %s", target_.text.c_str(), strerror(errno));
+        return;
+    }
+    HLOGE("h4: %s: the controller is not taking bytes (%s for %d s)", target_.text.c_str(),
+          isSocket() ? "its connection full" : "flow control held", kWriteTimeoutMs / 1000);
+    if (!isSocket()) tcflush(fd, TCOFLUSH);
 }
 
 // Wakes the reader (and, on a socket, a blocked writer), joins it, and only
@@ -383,6 +205,8 @@ void H4Hci::stop() {
     if (reader_.joinable()) reader_.join();
     std::lock_guard<std::mutex> writing(write_lock_);
     std::lock_guard<std::mutex> guard(lock_);
+    // Output still held by flow control would make close() wait for it.
+    if (fd_ != -1 && !isSocket()) tcflush(fd_, TCOFLUSH);
     if (fd_ != -1) ::close(fd_);
     fd_ = -1;
     if (wake_ != -1) ::close(wake_);

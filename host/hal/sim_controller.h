@@ -16,6 +16,9 @@ struct SimControllerSettings {
     bool reference_tx = false;
     // Fraction (0..1) of the packets on the air that the receiver misses.
     double loss = 0.0;
+    // Seconds the controller takes to process each command before it acts on
+    // it and answers, as a busy controller does.
+    double delay_s = 0.0;
 };
 
 class SimController {

@@ -3,6 +3,7 @@
 // callbacks never run inside the caller's stack. Close joins the thread.
 #include "host/hal/sim_hci.h"
 
+#include <chrono>
 #include <condition_variable>
 #include <deque>
 #include <memory>
@@ -25,7 +26,7 @@ std::shared_ptr<SimAir> process_air() {
 class SimHci final : public HostHci {
   public:
     explicit SimHci(SimControllerSettings settings)
-        : air_(process_air()), controller_(*air_, settings) {}
+        : settings_(settings), air_(process_air()), controller_(*air_, settings) {}
     ~SimHci() override { stop(); }
 
     Return<void> initialize(const sp<IBluetoothHciCallbacks>& callback) override;
@@ -40,6 +41,7 @@ class SimHci final : public HostHci {
     void answer(const std::vector<uint8_t>& command);
     void stop() override;
 
+    const SimControllerSettings settings_;
     std::shared_ptr<SimAir> air_;  // outlives controller_, which runs tests on it
     SimController controller_;     // event thread only (and stop, after the join)
     sp<IBluetoothHciCallbacks> callbacks_;
@@ -85,7 +87,13 @@ bool SimHci::nextWork(Work* work) {
     return true;
 }
 
+// The processing delay is waited out as a stop can cut it short.
 void SimHci::answer(const std::vector<uint8_t>& command) {
+    if (settings_.delay_s > 0) {
+        std::unique_lock<std::mutex> guard(lock_);
+        auto delay = std::chrono::duration<double>(settings_.delay_s);
+        if (wake_.wait_for(guard, delay, [this] { return !running_; })) return;
+    }
     for (const auto& event : controller_.command(command.data(), command.size())) {
         if (snoop_) snoop_->record(H4_TYPE_EVENT, event.data(), event.size(), true);
         callbacks_->hciEventReceived(hidl_vec<uint8_t>(event));

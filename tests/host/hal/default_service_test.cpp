@@ -16,7 +16,9 @@ namespace {
 
 class DefaultServiceTest : public ::testing::Test {
   protected: void TearDown() override {
-        for (const char* name : {"HALVENOR_HCI", "HALVENOR_SIM_REFTX", "HALVENOR_SIM_LOSS"}) unsetenv(name);
+        for (const char* name : {"HALVENOR_HCI", "HALVENOR_SIM_REFTX", "HALVENOR_SIM_LOSS", "HALVENOR_SIM_DELAY"}) {
+            unsetenv(name);
+        }
     }
     int linesWith(const std::string& fragment) {
         int n = 0;
@@ -38,6 +40,7 @@ TEST_F(DefaultServiceTest, UnusableSettingLogsOnceAndFailsTheSession) {
             {"HALVENOR_HCI", "tcp:127.0.0.1:70000", "port '70000' is not in 1..65535"},
             {"HALVENOR_HCI", "tty:/dev/ttyS0,12345", "baud rate 12345 is not a standard speed"},
             {"HALVENOR_SIM_LOSS", "2", "expected a fraction from 0 to 1"}, {"HALVENOR_SIM_REFTX", "yes", "expected 0 or 1"},
+            {"HALVENOR_SIM_DELAY", "11", "expected seconds from 0 to 10"},
     };
     for (const auto& c : cases) {
         log.clear();

@@ -1,16 +1,25 @@
 // The H4 backends against a real far end, a unix listener or a
-// pseudo-terminal: packets both ways, reassembly, and a controller that
-// leaves.
+// pseudo-terminal: packets both ways, reassembly, a controller that leaves or
+// stops taking bytes; and the capture they write.
 #include "host/hal/h4_hci.h"
+#include "host/hal/btsnoop.h"
+
+#include <netdb.h>
 
 #include <fcntl.h>
 #include <poll.h>
 #include <stdlib.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <termios.h>
 #include <unistd.h>
 
+#include <atomic>
+#include <chrono>
+#include <fstream>
+#include <iterator>
 #include <memory>
+#include <thread>
 
 #include <gtest/gtest.h>
 
@@ -42,6 +51,8 @@ class FarEnd {
         close(fd);
         fd = -1;
     }
+    // Stops taking bytes: a serial line's flow control held; a socket simply unread.
+    virtual void holdFlow() {}
     int fd = -1;
     int listener = -1;
 };
@@ -69,10 +80,19 @@ class PtyFarEnd : public FarEnd {
         unlockpt(fd);
         name_ = ptsname(fd);
     }
+    ~PtyFarEnd() override {
+        if (held_ >= 0) close(held_);
+    }
     std::string hci() override { return "tty:" + name_ + ",921600"; }
     bool accept() override { return fd >= 0; }
+    // The line's own output stopped, as CTS low stops a UART's.
+    void holdFlow() override {
+        held_ = open(name_.c_str(), O_RDWR | O_NOCTTY);
+        tcflow(held_, TCOOFF);
+    }
 
   private: std::string name_;
+    int held_ = -1;
 };
 
 using FarEndFactory = std::unique_ptr<FarEnd> (*)();
@@ -153,6 +173,90 @@ TEST_P(H4HciTest, ControllerClosingKillsTheService) {
     ASSERT_TRUE(waitUntil([&] { return log.containsFragment(far->listener < 0 ? "h4: " + far->hci() + ": "
                                                                              : "controller closed the connection"); }));
     EXPECT_TRUE(hci->sendHciCommand(hidl_vec<uint8_t>({0x03, 0x0C, 0x00})).isDeadObject());
+}
+
+// A controller that stops taking bytes fails the send within the write bound,
+// with the cause named, and closing the service does not wait for it.
+TEST_P(H4HciTest, ControllerThatStopsTakingBytesFailsTheSendWithinItsBound) {
+    connect();
+    far->holdFlow();
+    Bytes acl = {0x01, 0x00, 0xFF, 0xFF};
+    acl.resize(4 + 0xFFFF, 0xA5);
+    auto start = std::chrono::steady_clock::now();
+    bool dead = false;
+    for (int i = 0; i < 64 && !dead; ++i) dead = hci->sendAclData(acl).isDeadObject();
+    EXPECT_TRUE(dead) << "a write never stalled";
+    EXPECT_TRUE(log.containsFragment("h4: " + far->hci() + ": the controller is not taking bytes (")) ;
+    EXPECT_TRUE(log.containsFragment(" for 2 s)"));
+    EXPECT_TRUE(hci->close().isDeadObject());
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(8));
+    hci.clear();
+}
+
+// getaddrinfo has no time-out: a resolver that never answers must not hold
+// the opening past the connect bound.
+std::atomic<bool> g_release_resolver{false};
+int stuckResolver(const char*, const char*, const struct addrinfo*, struct addrinfo**) {
+    while (!g_release_resolver) std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    return EAI_AGAIN;
+}
+
+TEST(H4TargetTest, StuckNameResolutionFailsTheOpeningWithinTheConnectBound) {
+    LogCapture log;
+    h4_use_resolver(stuckResolver);
+    sp<IBluetoothHci> hci = serviceFor("tcp:resolver.stuck:4000");
+    sp<RecordingCallbacks> callbacks = new RecordingCallbacks();
+    hci->initialize(callbacks);
+    HciStatus status;
+    ASSERT_TRUE(callbacks->waitForInit(&status, 5000));
+    EXPECT_EQ(HciStatus::INITIALIZATION_ERROR, status);
+    EXPECT_TRUE(log.containsFragment("h4: cannot reach tcp:resolver.stuck:4000: host: no answer from the name "
+                                     "resolver within 3000 ms"));
+    g_release_resolver = true;
+    h4_use_resolver(nullptr);
+    hci->close().isOk();
+    unsetenv("HALVENOR_HCI");
+}
+
+// The user's capture follows the wall clock; the console's, whose records
+// time its counting windows, does not step with it.
+int64_t g_wall_us = 1700000000000000;
+int64_t fakeWallClock() { return g_wall_us; }
+
+// Stamps of the records in a capture, microseconds since the Unix epoch.
+std::vector<int64_t> stamps(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    Bytes file((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+    std::vector<int64_t> out;
+    for (size_t at = 16; at + 24 <= file.size();) {
+        uint64_t micros = 0;
+        for (int i = 0; i < 8; ++i) micros = micros << 8 | file[at + 16 + i];
+        out.push_back(static_cast<int64_t>(micros - 0x00DCDDB30F2F8000ULL));
+        at += 24 + (file[at + 4] << 24 | file[at + 5] << 16 | file[at + 6] << 8 | file[at + 7]);
+    }
+    return out;
+}
+
+TEST(BtsnoopTest, ConsoleCaptureIgnoresAStepOfTheWallClock) {
+    Btsnoop::useWallClock(fakeWallClock);
+    std::string user = tempPath("user.btsnoop"), console = tempPath("console.btsnoop");
+    auto userSnoop = Btsnoop::open(user), consoleSnoop = Btsnoop::open(console, true);
+    const Bytes reset = {0x03, 0x0C, 0x00};
+    for (int i = 0; i < 2; ++i) {
+        userSnoop->record(1, reset.data(), reset.size(), false);
+        consoleSnoop->record(1, reset.data(), reset.size(), false);
+        g_wall_us += 3600LL * 1000000;  // the clock is set an hour ahead
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    }
+    std::vector<int64_t> u = stamps(user), c = stamps(console);
+    ASSERT_EQ(2u, u.size());
+    ASSERT_EQ(2u, c.size());
+    EXPECT_EQ(3600LL * 1000000, u[1] - u[0]);
+    EXPECT_GE(c[1] - c[0], 20000);
+    EXPECT_LT(c[1] - c[0], 1000000);
+    Btsnoop::useWallClock(nullptr);
+    unlink(user.c_str());
+    unlink(console.c_str());
 }
 
 std::unique_ptr<FarEnd> unixFarEnd() { return std::unique_ptr<FarEnd>(new UnixFarEnd()); }
