@@ -72,20 +72,6 @@ void install(sp<FakeHal>& hal, FakeHal* replacement) {
 }
 
 const FaultCase kFaults[] = {
-        // The reply comes after the exchange gave up; the next command gets its own.
-        {"controller_answers_late", 3500, "cmd_rawcmd: event 0xe came before the command, skipped",
-         [](sp<FakeHal>& hal, std::vector<std::thread>&) {
-             auto silent = std::make_shared<std::atomic<bool>>(true);  // read on the pump thread
-             auto answer = hal->onSend;
-             hal->onSend = [silent, answer](FakeHal& h, const SentPacket& p) {
-                 if (!*silent) answer(h, p);
-             };
-             sendBleTestCommand(22402, 0);
-             hal->deliverEvent(commandComplete(0x201D));
-             *silent = false;
-             sendBleTestCommand(12402, 0);
-             EXPECT_TRUE(kLog.contains(ANDROID_LOG_INFO, "onSendCmdSuccess() command: 12402"));
-         }},
         // Events the controller sends on its own, every 100 ms, and never the
         // reply: they must not keep the exchange past its time-out.
         {"unsolicited_events_no_reply", 3500, "read_incoming_events: timed out after 2000 ms waiting for the packet type",

@@ -26,21 +26,6 @@ class H4Test : public ::testing::Test {
     LogCapture log;
 };
 
-TEST_F(H4Test, PayloadLengthFollowsEachTypesPreamble) {
-    const struct {
-        uint8_t type;
-        std::vector<uint8_t> preamble;
-        int length;
-    } cases[] = {
-            {H4_TYPE_ACL, {0x01, 0x20, 0x05, 0x00}, 5},   {H4_TYPE_ACL, {0x01, 0x20, 0x00, 0x01}, 256},
-            {H4_TYPE_ACL, {0x01, 0x20, 0xFF, 0xFF}, 65535}, {H4_TYPE_EVENT, {0x0E, 0xFF}, 255},
-            {H4_TYPE_COMMAND, {0x03, 0x0C, 0xFC}, 252},   {H4_TYPE_SCO, {0x01, 0x00, 0x82}, 130},
-            {0, {1, 2, 3, 4}, -1},                        {5, {1, 2, 3, 4}, -1},
-    };
-    for (const auto& c : cases) EXPECT_EQ(c.length, get_payload_len(c.type, c.preamble.data())) << int(c.type);
-    EXPECT_EQ(2, log.count(ANDROID_LOG_ERROR, "get_payload_len: Unsupported packet type, failed to get length"));
-}
-
 TEST_F(H4Test, ReadCollectsPiecesAndFailsWhenThePeerLeavesMidRun) {
     std::thread writer([&] {
         for (uint8_t b = 1; b <= 10; ++b) writeAll(fds[1], {b});

@@ -19,12 +19,14 @@ final class Bench implements TestModeUtils.Listener {
     /** The outcome of an LE Test End: confirmed by the library, and the count it reported (or null). */
     record End(boolean confirmed, Integer packets) {}
 
+    /** What an interrupt did to stop the controller, and the Test End it sent (or null). */
+    record Stop(String what, End end) {}
+
     private final Object lock = new Object();
     private final TestModeUtils radio;
     private final Observer observer;
     // Callbacks arrive on the thread inside the native call, which holds the lock.
     private final List<String> events = new ArrayList<>();
-    private long confirmedAt;
     private boolean closed;
     private boolean sessionOpen;
     private Activity activity = Activity.IDLE;
@@ -42,18 +44,7 @@ final class Bench implements TestModeUtils.Listener {
 
     @Override
     public void onSendCmdSuccess(int code) {
-        confirmedAt = System.nanoTime();
         events.add("sent:" + code);
-    }
-
-    /**
-     * When the last LE command was confirmed, by System.nanoTime: the controller's answer
-     * has just been read, so a test it started has been running since about then.
-     */
-    long confirmedAt() {
-        synchronized (lock) {
-            return confirmedAt;
-        }
     }
 
     /** Starts an LE test; true when the library confirmed that the controller accepted it. */
@@ -61,13 +52,13 @@ final class Bench implements TestModeUtils.Listener {
         synchronized (lock) {
             checkOpen();
             events.clear();
+            // Unconfirmed, the test may still have started (its reply came late): it is
+            // ended like a confirmed one.
             activity = Activity.LE_TEST;
+            Observer.Mark before = observer.mark();
             radio.sendTestCommandNative(code, enhanced);
             boolean confirmed = events.equals(List.of("sent:" + code));
-            sessionOpen = confirmed || !observer.exchanges().isEmpty();
-            if (!confirmed) {
-                activity = Activity.IDLE;
-            }
+            sessionOpen = confirmed || !observer.exchanges(before).isEmpty();
             return confirmed;
         }
     }
@@ -133,12 +124,12 @@ final class Bench implements TestModeUtils.Listener {
      * releases the library and keeps the main thread from sending anything afterwards.
      * Returns what it did, or null when nothing was running.
      */
-    String interrupt() {
+    Stop interrupt() {
         synchronized (lock) {
             if (closed) {
-                return null;
+                return new Stop(null, null);
             }
-            String done = stopActivityLocked();
+            Stop done = stopActivityLocked();
             closed = true;
             radio.destoryNative();
             return done;
@@ -155,19 +146,23 @@ final class Bench implements TestModeUtils.Listener {
         }
     }
 
-    private String stopActivityLocked() {
+    private Stop stopActivityLocked() {
         switch (activity) {
             case LE_TEST: {
                 End end = endLocked();
-                return end.packets() == null ? "sent LE Test End"
-                                             : "sent LE Test End (" + end.packets() + " packets received)";
+                if (!end.confirmed()) {
+                    quitLocked();
+                    return new Stop("sent LE Test End, then HCI Reset as it was not confirmed", end);
+                }
+                return new Stop(end.packets() == null ? "sent LE Test End"
+                                : "sent LE Test End (" + end.packets() + " packets received)", end);
             }
             case CONTINUOUS_WAVE:
             case DEVICE_UNDER_TEST:
                 quitLocked();
-                return "sent HCI Reset";
+                return new Stop("sent HCI Reset", null);
             default:
-                return null;
+                return new Stop(null, null);
         }
     }
 
@@ -190,8 +185,9 @@ final class Bench implements TestModeUtils.Listener {
     // it was sent all the same, and a session is all it is for.
     private boolean openSession() {
         events.clear();
+        Observer.Mark before = observer.mark();
         radio.sendTestCommandNative(TestModeUtils.TEST_END, false);
-        sessionOpen = observer.exchanges().stream().anyMatch(e -> e.opcode() == Runner.LE_TEST_END);
+        sessionOpen = observer.exchanges(before).stream().anyMatch(e -> e.opcode() == Runner.LE_TEST_END);
         return sessionOpen;
     }
 

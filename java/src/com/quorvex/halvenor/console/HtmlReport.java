@@ -103,26 +103,32 @@ final class HtmlReport {
         b.append("</tr></thead><tbody>\n");
         for (int i = 0; i < steps.size(); i++) {
             Step s = steps.get(i);
-            b.append("<tr data-step=\"").append(i).append("\">");
-            cell(s.name);
-            cell(s.setting);
-            cell(Double.isNaN(s.seconds) ? "-" : String.format(Locale.ROOT, "%.2f s", s.seconds));
-            cell(s.received == null ? "-" : s.received + (s.windows.size() > 1 ? " (" + s.windows.size() + " windows)" : ""));
-            cell(s.expected == null ? "-" : s.expected + (s.expectedGiven ? " (given)" : ""));
-            cell(s.per == null ? "-" : s.per.percent());
-            b.append("<td class=\"wrap\"><ul class=\"answers\">");
-            for (Observer.Exchange e : s.commands) {
-                b.append("<li title=\"").append(esc(Hci.commandLabel(e.opcode()))).append("\">")
-                 .append(esc(Hci.commandName(e.opcode()))).append(": ").append(esc(e.statusText())).append("</li>");
+            synchronized (s) {  // a signal's hook may be finishing the step
+                row(i, s);
             }
-            b.append("</ul></td><td class=\"wrap ").append(s.ok ? "ok" : "bad").append("\">")
-             .append(s.ok ? "ok" : s.interrupted ? "INTERRUPTED" : "FAILED");
-            if (s.error != null) {
-                b.append("<br>").append(esc(s.error));
-            }
-            b.append("</td></tr>\n");
         }
         b.append("</tbody></table></div>\n");
+    }
+
+    private void row(int i, Step s) {
+        b.append("<tr data-step=\"").append(i).append("\">");
+        cell(s.name);
+        cell(s.setting);
+        cell(Double.isNaN(s.seconds) ? "-" : String.format(Locale.ROOT, "%.2f s", s.seconds));
+        cell(s.received == null ? "-" : s.received + (s.windows.size() > 1 ? " (" + s.windows.size() + " windows)" : ""));
+        cell(s.expected == null ? "-" : s.expected + (s.expectedGiven != null ? " (given)" : ""));
+        cell(s.per == null ? "-" : s.per.percent());
+        b.append("<td class=\"wrap\"><ul class=\"answers\">");
+        for (Observer.Exchange e : s.commands) {
+            b.append("<li title=\"").append(esc(Hci.commandLabel(e.opcode()))).append("\">")
+             .append(esc(Hci.commandName(e.opcode()))).append(": ").append(esc(e.statusText())).append("</li>");
+        }
+        b.append("</ul></td><td class=\"wrap ").append(s.ok ? "ok" : "bad").append("\">")
+         .append(s.ok ? "ok" : s.interrupted ? "INTERRUPTED" : "FAILED");
+        if (s.error != null) {
+            b.append("<br>").append(esc(s.error));
+        }
+        b.append("</td></tr>\n");
     }
 
     private void cell(String text) {

@@ -14,7 +14,8 @@ public final class Main {
     static final int EXIT_OK = 0;
     static final int EXIT_FAILED = 1;
     static final int EXIT_USAGE = 2;
-    private static final long INTERRUPT_BOUND_MS = 10_000;
+    /** A signal ends the process within 3 s, whatever the controller does. */
+    private static final long INTERRUPT_BOUND_MS = 2_500;
 
     private Main() {}
 
@@ -98,7 +99,7 @@ public final class Main {
      * than hanging on Ctrl-C.
      */
     private static void interrupted(Bench bench, Runner runner, Report report, Trace trace, PrintStream err) {
-        String[] done = new String[1];
+        Bench.Stop[] done = new Bench.Stop[1];
         Step current = runner.current();
         Thread stopper = new Thread(() -> done[0] = bench.interrupt(), "halvenor-stop");
         stopper.setDaemon(true);
@@ -108,11 +109,14 @@ public final class Main {
         } catch (InterruptedException e) {
             Thread.currentThread().interrupt();
         }
-        String what = stopper.isAlive()
-                ? "the controller did not answer within " + INTERRUPT_BOUND_MS / 1000 + " s; it may still be running a test"
-                : done[0];
+        boolean answered = !stopper.isAlive();
+        String what = answered ? done[0].what()
+                : "the controller did not answer within " + INTERRUPT_BOUND_MS / 1000.0 + " s; it may still be running a test";
         if (trace != null) {
             trace.stop();
+        }
+        if (current != null) {
+            runner.interrupted(current, answered ? done[0].end() : null, "interrupted" + (what == null ? "" : ": " + what));
         }
         report.finish(current, what);
         if (what != null) {

@@ -4,6 +4,7 @@
 package com.quorvex.halvenor.console;
 
 import java.io.PrintStream;
+import java.util.function.BooleanSupplier;
 
 final class Progress {
     private static final int WIDTH = 30;
@@ -22,11 +23,14 @@ final class Progress {
         return new Progress(out, System.console() != null);
     }
 
-    /** Holds the current thread for {@code seconds}, the test running meanwhile. */
-    void hold(String label, double seconds, double doneBefore, double total) {
+    /**
+     * Holds the current thread for {@code seconds}, the test running meanwhile, or until
+     * {@code stop} (asked every tick) says the wait is pointless.
+     */
+    void hold(String label, double seconds, double doneBefore, double total, BooleanSupplier stop) {
         long start = System.nanoTime();
         long end = start + (long) (seconds * 1e9);
-        for (long now = start; now < end; now = System.nanoTime()) {
+        for (long now = start; now < end && !stop.getAsBoolean(); now = System.nanoTime()) {
             draw(label, doneBefore + (now - start) / 1e9, total);
             sleepNanos(Math.min(end - now, TICK_MS * 1_000_000));
         }

@@ -64,7 +64,9 @@ final class Report {
             progress.clear();
             // The hook may have taken the step just before the main thread finished and added it.
             if (interrupted != null && !steps.contains(interrupted)) {
-                interrupted.interrupt("interrupted" + (interruption == null ? "" : ": " + interruption));
+                if (!interrupted.interrupted) {
+                    interrupted.interrupt("interrupted" + (interruption == null ? "" : ": " + interruption));
+                }
                 add(interrupted);
             }
             finished = true;
@@ -102,6 +104,10 @@ final class Report {
         for (Step s : steps) {
             if (!s.ok) {
                 out.println((s.interrupted ? "" : "FAILED ") + s.name + " " + s.setting + ": " + s.error);
+            } else if (s.timingTooUncertain()) {
+                out.println(String.format(Locale.ROOT, "%s %s: timing too uncertain to judge PER: the replies took"
+                                          + " %.3f s of a %.3f s window", s.name, s.setting,
+                                          s.uncertaintyMicros() / 1e6, s.windowMicros / 1e6));
             }
         }
         long ok = steps.stream().filter(s -> s.ok).count();
@@ -121,12 +127,18 @@ final class Report {
     }
 
     private static String[] row(Step s) {
+        synchronized (s) {
+            return rowLocked(s);
+        }
+    }
+
+    private static String[] rowLocked(Step s) {
         String time = Double.isNaN(s.seconds) ? "-" : String.format(Locale.ROOT, "%.2f s", s.seconds);
         String received = s.received == null ? "-" : s.received.toString();
         if (s.windows.size() > 1) {
             received += " (" + s.windows.size() + " windows)";
         }
-        String expected = s.expected == null ? "-" : s.expected + (s.expectedGiven ? " (given)" : "");
+        String expected = s.expected == null ? "-" : s.expected + (s.expectedGiven != null ? " (given)" : "");
         String per = s.per == null ? "-" : s.per.percent();
         String result = s.ok ? "ok" : s.interrupted ? "INTERRUPTED" : "FAILED";
         return new String[] {s.name, s.setting, time, received, expected, per, result};
@@ -151,6 +163,12 @@ final class Report {
     }
 
     private static String step(Step s) {
+        synchronized (s) {  // a signal's hook may be finishing the step
+            return stepLocked(s);
+        }
+    }
+
+    private static String stepLocked(Step s) {
         StringBuilder b = new StringBuilder("{");
         b.append("\"step\":").append(quote(s.name));
         b.append(",\"setting\":").append(quote(s.setting));
@@ -171,7 +189,11 @@ final class Report {
             b.append(",\"windows\":").append(s.windows);
             b.append(",\"received\":").append(s.received);
             b.append(",\"expected\":").append(s.expected);
-            b.append(",\"expected_given\":").append(s.expectedGiven);
+            b.append(",\"expected_given\":").append(s.expectedGiven != null);
+            b.append(",\"expected_range\":[").append(s.expectedLow).append(',').append(s.expectedHigh).append(']');
+            b.append(",\"window_s\":").append(num(s.windowMicros / 1e6));
+            b.append(",\"timing_uncertainty_s\":").append(num(s.uncertaintyMicros() / 1e6));
+            b.append(",\"timing_too_uncertain\":").append(s.timingTooUncertain());
             if (s.per != null) {
                 b.append(",\"per\":").append(num(s.per.rate()));
                 b.append(",\"per_ci95\":[").append(num(s.per.low())).append(',').append(num(s.per.high())).append(']');
