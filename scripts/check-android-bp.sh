@@ -56,6 +56,7 @@ cc_library_shared {
     srcs: [
         "../vendor/host/hidl/service_registry.cpp",
         "../vendor/host/hal/*.cpp",
+        "../vendor/transport/h4_frame.cpp",
     ],
     local_include_dirs: ["../vendor"],
     shared_libs: [
