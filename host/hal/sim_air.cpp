@@ -38,9 +38,24 @@ uint64_t packets_in_window(int64_t start, int64_t interval, int64_t from, int64_
     return static_cast<uint64_t>(last - first);
 }
 
-uint64_t apply_loss(uint64_t sent, double loss) {
-    loss = std::min(1.0, std::max(0.0, loss));
-    return static_cast<uint64_t>(std::llround(static_cast<double>(sent) * (1.0 - loss)));
+SimLoss::SimLoss(double loss, double burst, uint64_t seed)
+    : loss_(std::min(1.0, std::max(0.0, loss))),
+      burst_(std::max(1.0, burst)),
+      rng_(seed != 0 ? seed : std::random_device()()) {}
+
+uint64_t SimLoss::received(uint64_t sent) {
+    if (loss_ <= 0.0 || loss_ >= 1.0) return loss_ <= 0.0 ? sent : 0;
+    if (burst_ <= 1.0) return std::binomial_distribution<uint64_t>(sent, 1.0 - loss_)(rng_);
+    // A burst ends after each lost packet with 1/burst; one starts at the rate
+    // that keeps the share of lost packets at loss_.
+    std::bernoulli_distribution ends(1.0 / burst_);
+    std::bernoulli_distribution starts(loss_ / (burst_ * (1.0 - loss_)));
+    uint64_t heard = 0;
+    for (uint64_t i = 0; i < sent; ++i) {
+        in_burst_ = in_burst_ ? !ends(rng_) : starts(rng_);
+        heard += in_burst_ ? 0 : 1;
+    }
+    return heard;
 }
 
 static bool same_phy(uint8_t rx, uint8_t tx) {

@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <functional>
 #include <mutex>
+#include <random>
 #include <vector>
 
 // LE PHYs as the LE Transmitter/Receiver Test commands number them; a
@@ -64,5 +65,20 @@ int64_t le_packet_airtime_us(uint8_t phy, uint8_t length);
 int64_t le_test_interval_us(uint8_t phy, uint8_t length);
 // Packets sent at start, start + interval, ... that fall in [from, to).
 uint64_t packets_in_window(int64_t start, int64_t interval, int64_t from, int64_t to);
-// Count after the expected loss, rounded to the nearest packet.
-uint64_t apply_loss(uint64_t sent, double loss);
+// Which packets a receiver misses, as on a real channel: each is lost at
+// random with the set probability; with bursts longer than 1, losses come in
+// bursts of that mean length (a two-state Gilbert channel) at the same
+// overall rate. Seeded, so that a run can be repeated. One thread at a time.
+class SimLoss {
+  public:
+    // seed 0: a seed of its own, different for every channel.
+    SimLoss(double loss, double burst, uint64_t seed);
+    // How many of `sent` packets arrive.
+    uint64_t received(uint64_t sent);
+
+  private:
+    double loss_;
+    double burst_;
+    std::mt19937_64 rng_;
+    bool in_burst_ = false;
+};

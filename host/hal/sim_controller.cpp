@@ -178,7 +178,7 @@ uint16_t SimCommands::receivedPackets(SimController& c) {
         sent += packets_in_window(c.rx_start_, interval, c.rx_start_, end);
     }
     // Num_Packets is 16 bits; a long test wraps as a controller's counter does.
-    return static_cast<uint16_t>(apply_loss(sent, c.settings_.loss) & 0xFFFF);
+    return static_cast<uint16_t>(c.loss_.received(sent) & 0xFFFF);
 }
 
 // A transmitter test reports 0 packets; so does a Test End with no test.
@@ -189,7 +189,7 @@ void SimCommands::testEnd(SimController& c, const uint8_t*, size_t, Reply& reply
 }
 
 SimController::SimController(SimAir& air, SimControllerSettings settings)
-    : air_(air), settings_(settings) {}
+    : air_(air), settings_(settings), loss_(settings.loss, settings.burst, settings.seed) {}
 
 SimController::~SimController() { endTests(); }
 

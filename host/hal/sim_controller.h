@@ -14,8 +14,12 @@ struct SimControllerSettings {
     // controller (its channel and PHY, 37-byte payloads), as the far-end
     // tester of a bench would.
     bool reference_tx = false;
-    // Fraction (0..1) of the packets on the air that the receiver misses.
+    // Fraction (0..1) of the packets on the air that the receiver misses, at
+    // random; in bursts of this mean length (1: each packet on its own); from
+    // this seed (0: a seed of its own).
     double loss = 0.0;
+    double burst = 1.0;
+    uint64_t seed = 0;
     // Seconds the controller takes to process each command before it acts on
     // it and answers, as a busy controller does.
     double delay_s = 0.0;
@@ -42,6 +46,7 @@ class SimController {
     enum class Test { NONE, TX, RX };
     SimAir& air_;
     SimControllerSettings settings_;
+    SimLoss loss_;
     Test test_ = Test::NONE;
     uint8_t rx_channel_ = 0;
     uint8_t rx_phy_ = LE_PHY_1M;
