@@ -11,6 +11,7 @@
 #include "host/hal/host_hci.h"
 #include "host/hal/host_log.h"
 #include "host/hal/sim_hci.h"
+#include "host/hal/sim_settings.h"
 
 namespace {
 
@@ -33,34 +34,31 @@ std::string env_or(const char* name, const char* fallback) {
     return value != nullptr && value[0] != '\0' ? value : fallback;
 }
 
-// A decimal number from 0 to max.
-bool parse_range(const std::string& text, double max, double* out) {
-    char* end = nullptr;
-    double v = strtod(text.c_str(), &end);
-    if (end == text.c_str() || *end != '\0' || !(v >= 0.0 && v <= max)) return false;
-    *out = v;
-    return true;
-}
+// One HALVENOR_SIM_* variable: its default, and how its value is taken.
+struct SimVariable {
+    const char* name;
+    const char* fallback;
+    bool (*take)(const char* text, SimControllerSettings* settings, std::string* range);
+};
 
-// HALVENOR_SIM_REFTX (1 on, 0 off; default on), HALVENOR_SIM_LOSS (0..1) and
-// HALVENOR_SIM_DELAY (seconds, 0..10).
+const SimVariable kSimVariables[] = {
+        {"HALVENOR_SIM_REFTX", "1", sim_take_reftx},
+        {"HALVENOR_SIM_LOSS", "0", sim_take_loss},
+        {"HALVENOR_SIM_BURST", "1", sim_take_burst},
+        {"HALVENOR_SIM_SEED", "0", sim_take_seed},
+        {"HALVENOR_SIM_DELAY", "0", sim_take_delay},
+};
+
+// The simulated controller's settings from the environment; an unusable
+// value is logged with its range.
 bool sim_settings(SimControllerSettings* settings) {
-    std::string reftx = env_or("HALVENOR_SIM_REFTX", "1");
-    std::string loss = env_or("HALVENOR_SIM_LOSS", "0");
-    std::string delay = env_or("HALVENOR_SIM_DELAY", "0");
-    if (reftx != "0" && reftx != "1") {
-        HLOGE("HALVENOR_SIM_REFTX=\"%s\": expected 0 or 1", reftx.c_str());
-        return false;
+    for (const SimVariable& v : kSimVariables) {
+        std::string value = env_or(v.name, v.fallback), range;
+        if (!v.take(value.c_str(), settings, &range)) {
+            HLOGE("%s=\"%s\": expected %s", v.name, value.c_str(), range.c_str());
+            return false;
+        }
     }
-    if (!parse_range(loss, 1, &settings->loss)) {
-        HLOGE("HALVENOR_SIM_LOSS=\"%s\": expected a fraction from 0 to 1", loss.c_str());
-        return false;
-    }
-    if (!parse_range(delay, 10, &settings->delay_s)) {
-        HLOGE("HALVENOR_SIM_DELAY=\"%s\": expected seconds from 0 to 10", delay.c_str());
-        return false;
-    }
-    settings->reference_tx = reftx == "1";
     return true;
 }
 

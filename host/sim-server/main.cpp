@@ -10,6 +10,7 @@
 
 #include <string>
 
+#include "host/hal/sim_settings.h"
 #include "host/sim-server/sim_server.h"
 
 static int stop_pipe[2] = {-1, -1};
@@ -20,45 +21,109 @@ static void on_signal(int) {
     (void)ignored;
 }
 
-static void usage() {
-    fprintf(stderr,
-            "usage: halvenor-sim [--unix PATH | --tcp PORT] [--reftx 0|1] [--loss FRACTION]\n"
-            "  --unix PATH      listen on a unix socket\n"
-            "  --tcp PORT       listen on 127.0.0.1:PORT (default; 0 picks a free port)\n"
-            "  --reftx 0|1      a reference transmitter follows every receiver test (default 0)\n"
-            "  --loss FRACTION  fraction of packets each receiver misses, 0 to 1 (default 0)\n"
-            "Prints the address to give HALVENOR_HCI, e.g. 'listening on tcp:127.0.0.1:40123'.\n");
+static bool take_unix(const char* text, SimServerOptions* o, std::string* range) {
+    if (*text == '\0') return *range = "a socket path", false;
+    o->unix_path = text;
+    return true;
 }
 
+static bool take_tcp(const char* text, SimServerOptions* o, std::string* range) {
+    char* end = nullptr;
+    long port = strtol(text, &end, 10);
+    if (*text == '\0' || *end != '\0' || port < 0 || port > 65535) {
+        return *range = "a port from 0 to 65535 (0: a free one)", false;
+    }
+    o->tcp_port = static_cast<int>(port);
+    o->tcp_given = true;
+    return true;
+}
+
+// The options, each once: its name, its value, what it does; the usage and
+// the parser both read this table.
+struct OptionRow {
+    const char* name;
+    const char* value;
+    const char* help;
+    bool (*take_server)(const char*, SimServerOptions*, std::string*);
+    bool (*take_controller)(const char*, SimControllerSettings*, std::string*);
+};
+
+static const OptionRow kOptions[] = {
+        {"unix", "PATH", "listen on a unix socket", take_unix, nullptr},
+        {"tcp", "PORT", "listen on 127.0.0.1:PORT, 0 to 65535 (the default; 0 picks a free port)", take_tcp, nullptr},
+        {"reftx", "0|1", "1: a reference transmitter follows every receiver test (default 0)", nullptr, sim_take_reftx},
+        {"loss", "FRACTION", "share of packets each receiver misses at random, 0 to 1 (default 0)", nullptr, sim_take_loss},
+        {"burst", "PACKETS", "mean length of a burst of lost packets, 1 to 1000 (default 1: each on its own)", nullptr,
+         sim_take_burst},
+        {"seed", "N", "seed of the losses, to repeat a run (default 0: a seed of its own)", nullptr, sim_take_seed},
+        {"delay", "SECONDS", "seconds each command takes the controller, 0 to 10 (default 0)", nullptr, sim_take_delay},
+};
+
+static void usage(FILE* out) {
+    fprintf(out, "usage: halvenor-sim [--unix PATH | --tcp PORT] [options]\n");
+    for (const OptionRow& o : kOptions) {
+        std::string left = std::string("--") + o.name + " " + o.value;
+        fprintf(out, "  %-18s %s\n", left.c_str(), o.help);  // a test holds these to the console's table
+    }
+    fprintf(out, "Prints the address to give HALVENOR_HCI, e.g. 'listening on tcp:127.0.0.1:40123'.\n");
+}
+
+static const OptionRow* find_option(const std::string& name) {
+    for (const OptionRow& o : kOptions) {
+        if (name == o.name) return &o;
+    }
+    return nullptr;
+}
+
+// One option and its value; false after the error line.
+static bool take(const std::string& name, const char* value, SimServerOptions* options) {
+    const OptionRow* o = find_option(name);
+    if (o == nullptr) {
+        fprintf(stderr, "halvenor-sim: unknown option '--%s'\n", name.c_str());
+        return false;
+    }
+    if (value == nullptr || (value[0] == '-' && value[1] != '\0')) {
+        fprintf(stderr, "halvenor-sim: option --%s needs a value (%s)\n", o->name, o->value);
+        return false;
+    }
+    std::string range;
+    bool ok = o->take_server != nullptr ? o->take_server(value, options, &range)
+                                        : o->take_controller(value, &options->controller, &range);
+    if (!ok) fprintf(stderr, "halvenor-sim: bad --%s '%s': expected %s\n", o->name, value, range.c_str());
+    return ok;
+}
+
+// "--name value" or "--name=value"; a value written apart never starts with '-'.
 static bool parse_args(int argc, char** argv, SimServerOptions* options) {
     for (int i = 1; i < argc; ++i) {
         std::string arg = argv[i];
-        if (i + 1 >= argc) return false;
-        std::string value = argv[++i];
-        char* end = nullptr;
-        if (arg == "--unix") {
-            options->unix_path = value;
-        } else if (arg == "--tcp") {
-            long port = strtol(value.c_str(), &end, 10);
-            if (*end != '\0' || port < 0 || port > 65535) return false;
-            options->tcp_port = static_cast<int>(port);
-        } else if (arg == "--reftx" && (value == "0" || value == "1")) {
-            options->controller.reference_tx = value == "1";
-        } else if (arg == "--loss") {
-            double loss = strtod(value.c_str(), &end);
-            if (*end != '\0' || !(loss >= 0.0 && loss <= 1.0)) return false;
-            options->controller.loss = loss;
-        } else {
+        if (arg.rfind("--", 0) != 0) {
+            fprintf(stderr, "halvenor-sim: unexpected argument '%s'\n", arg.c_str());
             return false;
         }
+        size_t eq = arg.find('=');
+        std::string name = arg.substr(2, eq == std::string::npos ? std::string::npos : eq - 2);
+        const char* value = eq != std::string::npos ? argv[i] + eq + 1 : (i + 1 < argc ? argv[++i] : nullptr);
+        if (eq != std::string::npos && *value == '\0') value = nullptr;
+        if (!take(name, value, options)) return false;
+    }
+    if (!options->unix_path.empty() && options->tcp_given) {
+        fprintf(stderr, "halvenor-sim: --unix and --tcp exclude each other: give one\n");
+        return false;
     }
     return true;
 }
 
 int main(int argc, char** argv) {
+    for (int i = 1; i < argc; ++i) {
+        if (strcmp(argv[i], "--help") == 0 || strcmp(argv[i], "-h") == 0) {
+            usage(stdout);
+            return 0;
+        }
+    }
     SimServerOptions options;
     if (!parse_args(argc, argv, &options)) {
-        usage();
+        fprintf(stderr, "halvenor-sim: run 'halvenor-sim --help' for the options\n");
         return 2;
     }
     if (pipe2(stop_pipe, O_CLOEXEC) == -1) {
@@ -69,10 +134,10 @@ int main(int argc, char** argv) {
     signal(SIGINT, on_signal);
     signal(SIGTERM, on_signal);
 
-    std::string where;
-    int listen_fd = sim_server_listen(options, &where);
+    std::string where, why;
+    int listen_fd = sim_server_listen(options, &where, &why);
     if (listen_fd == -1) {
-        fprintf(stderr, "halvenor-sim: cannot listen (see the log line above)\n");
+        fprintf(stderr, "halvenor-sim: %s\n", why.c_str());
         return 1;
     }
     printf("listening on %s\n", where.c_str());

@@ -10,6 +10,7 @@
 #include <poll.h>
 #include <string.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -23,18 +24,29 @@
 #include "host/hal/h4_stream.h"
 #include "host/hal/host_log.h"
 
-static int listen_unix(const std::string& path, std::string* where) {
+// A socket left by a run that ended can be taken over; one that something
+// still answers on, or a file that is no socket, cannot.
+static bool path_free(const std::string& path, const sockaddr_un& addr, std::string* why) {
+    struct stat st;
+    if (lstat(path.c_str(), &st) == -1) return true;
+    if (!S_ISSOCK(st.st_mode)) return *why = "cannot listen on " + path + ": it exists and is not a socket", false;
+    int probe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    bool served = probe != -1 && connect(probe, reinterpret_cast<const sockaddr*>(&addr), sizeof(addr)) == 0;
+    if (probe != -1) close(probe);
+    if (served) return *why = "cannot listen on " + path + ": another process serves it", false;
+    unlink(path.c_str());
+    return true;
+}
+
+static int listen_unix(const std::string& path, std::string* where, std::string* why) {
     struct sockaddr_un addr = {};
-    if (path.size() >= sizeof(addr.sun_path)) {
-        HLOGE("halvenor-sim: socket path too long: %s", path.c_str());
-        return -1;
-    }
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (path.size() >= sizeof(addr.sun_path)) return *why = "socket path too long: " + path, -1;
     addr.sun_family = AF_UNIX;
     memcpy(addr.sun_path, path.c_str(), path.size());
-    unlink(path.c_str());  // a socket left by an earlier run
+    if (!path_free(path, addr, why)) return -1;
+    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
     if (fd == -1 || bind(fd, reinterpret_cast<sockaddr*>(&addr), sizeof(addr)) == -1 || listen(fd, 8) == -1) {
-        HLOGE("halvenor-sim: cannot listen on %s: %s", path.c_str(), strerror(errno));
+        *why = "cannot listen on " + path + ": " + strerror(errno);
         if (fd != -1) close(fd);
         return -1;
     }
@@ -42,7 +54,7 @@ static int listen_unix(const std::string& path, std::string* where) {
     return fd;
 }
 
-static int listen_tcp(int port, std::string* where) {
+static int listen_tcp(int port, std::string* where, std::string* why) {
     int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
     int one = 1;
     if (fd != -1) setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &one, sizeof(one));
@@ -53,7 +65,7 @@ static int listen_tcp(int port, std::string* where) {
     socklen_t len = sizeof(addr);
     if (fd == -1 || bind(fd, reinterpret_cast<sockaddr*>(&addr), len) == -1 || listen(fd, 8) == -1 ||
         getsockname(fd, reinterpret_cast<sockaddr*>(&addr), &len) == -1) {
-        HLOGE("halvenor-sim: cannot listen on 127.0.0.1:%d: %s", port, strerror(errno));
+        *why = "cannot listen on 127.0.0.1:" + std::to_string(port) + ": " + strerror(errno);
         if (fd != -1) close(fd);
         return -1;
     }
@@ -61,9 +73,9 @@ static int listen_tcp(int port, std::string* where) {
     return fd;
 }
 
-int sim_server_listen(const SimServerOptions& options, std::string* where) {
-    if (!options.unix_path.empty()) return listen_unix(options.unix_path, where);
-    return listen_tcp(options.tcp_port, where);
+int sim_server_listen(const SimServerOptions& options, std::string* where, std::string* why) {
+    if (!options.unix_path.empty()) return listen_unix(options.unix_path, where, why);
+    return listen_tcp(options.tcp_port, where, why);
 }
 
 // One connection: commands in, the controller's events out, in order.

@@ -16,7 +16,8 @@ namespace {
 
 class DefaultServiceTest : public ::testing::Test {
   protected: void TearDown() override {
-        for (const char* name : {"HALVENOR_HCI", "HALVENOR_SIM_REFTX", "HALVENOR_SIM_LOSS", "HALVENOR_SIM_DELAY"}) {
+        for (const char* name : {"HALVENOR_HCI", "HALVENOR_SIM_REFTX", "HALVENOR_SIM_LOSS", "HALVENOR_SIM_DELAY",
+                                 "HALVENOR_SIM_BURST", "HALVENOR_SIM_SEED"}) {
             unsetenv(name);
         }
     }
@@ -41,6 +42,8 @@ TEST_F(DefaultServiceTest, UnusableSettingLogsOnceAndFailsTheSession) {
             {"HALVENOR_HCI", "tty:/dev/ttyS0,12345", "baud rate 12345 is not a standard speed"},
             {"HALVENOR_SIM_LOSS", "2", "expected a fraction from 0 to 1"}, {"HALVENOR_SIM_REFTX", "yes", "expected 0 or 1"},
             {"HALVENOR_SIM_DELAY", "11", "expected seconds from 0 to 10"},
+            {"HALVENOR_SIM_BURST", "0.5", "expected a mean burst length from 1 to 1000 packets"},
+            {"HALVENOR_SIM_SEED", "-1", "expected a whole number (0: a seed of its own)"},
     };
     for (const auto& c : cases) {
         log.clear();
