@@ -10,6 +10,16 @@
 
 static const char kClassName[] = "com/quorvex/halvenor/TestModeUtils";
 
+// The commit the library was built from, read from the library file by the host
+// console's --version: the library exports only what the app and the platform
+// look up. A build without the generated header (the platform's) says unknown.
+#if __has_include("halvenor_commit.h")
+#include "halvenor_commit.h"
+#else
+#define HALVENOR_COMMIT "unknown"
+#endif
+__attribute__((used)) static const char kBuildCommit[] = "halvenor-build-commit:" HALVENOR_COMMIT;
+
 // Writable: JNINativeMethod's fields are plain char pointers.
 JNINativeMethod gMethods[7] = {
         {const_cast<char*>("classInitNative"), const_cast<char*>("()V"),
