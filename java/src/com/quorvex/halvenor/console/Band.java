@@ -28,13 +28,14 @@ enum Band {
         return mhz + " MHz (ch " + channel + ")";
     }
 
-    static Band parse(String text) throws UsageException {
+    /** The band of "2440" or "2440MHz", or null. */
+    static Band parse(String text) {
         String t = text.trim().toLowerCase().replace("mhz", "").trim();
         for (Band b : values()) {
             if (t.equals(Integer.toString(b.mhz))) {
                 return b;
             }
         }
-        throw new UsageException("bad --freq '" + text + "': valid values are 2402 (ch 0), 2440 (ch 19), 2480 (ch 39)");
+        return null;
     }
 }

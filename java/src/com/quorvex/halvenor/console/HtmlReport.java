@@ -6,7 +6,6 @@ package com.quorvex.halvenor.console;
 import java.io.IOException;
 import java.io.InputStream;
 import java.net.InetAddress;
-import java.nio.charset.StandardCharsets;
 import java.nio.file.Files;
 import java.nio.file.Path;
 import java.security.MessageDigest;
@@ -15,17 +14,13 @@ import java.time.Instant;
 import java.time.ZoneId;
 import java.time.ZonedDateTime;
 import java.time.format.DateTimeFormatter;
+import java.util.ArrayList;
 import java.util.HexFormat;
 import java.util.List;
 import java.util.Locale;
 import java.util.TreeSet;
 
 final class HtmlReport {
-    /**
-     * The receiver sensitivity level is where PER reaches 30.8 % with 37-byte payloads
-     * (Core Specification Vol 6, Part A, 4.1): the level a receiver test is judged against.
-     */
-    static final double SENSITIVITY_PER = 0.308;
     /** A long Device Under Test hold can carry a tester's traffic; the page keeps the start of it. */
     private static final int MAX_TRACE_PACKETS = 5000;
     // Okabe-Ito colours, told apart with every common colour vision deficiency; the
@@ -43,18 +38,15 @@ final class HtmlReport {
 
     private HtmlReport() {}
 
-    static void write(Path file, Options o, List<Step> steps, String json, Path capture) throws IOException {
+    /** The page of the run; `outcome` is its summary line, `ok` whether it exits 0. */
+    static String page(Options o, List<Step> steps, String json, Path capture, String outcome, boolean ok) {
         HtmlReport r = new HtmlReport();
-        r.page(o, steps, json, capture);
-        Files.writeString(file, r.b, StandardCharsets.UTF_8);
+        r.build(o, steps, json, capture, outcome.startsWith("interrupted") ? "INTERRUPTED: " + outcome : outcome, ok);
+        return r.b.toString();
     }
 
-    private void page(Options o, List<Step> steps, String json, Path capture) {
+    private void build(Options o, List<Step> steps, String json, Path capture, String verdict, boolean ok) {
         boolean interrupted = steps.stream().anyMatch(s -> s.interrupted);
-        boolean ok = !steps.isEmpty() && steps.stream().allMatch(s -> s.ok);
-        String verdict = interrupted ? "INTERRUPTED" : ok ? "all " + steps.size() + " steps ok"
-                                                          : steps.stream().filter(s -> !s.ok).count() + " of "
-                                                            + steps.size() + " steps FAILED";
         b.append("<!DOCTYPE html>\n<html lang=\"en\"><head><meta charset=\"utf-8\">")
          .append("<meta name=\"viewport\" content=\"width=device-width, initial-scale=1\">")
          .append("<title>halvenor ").append(esc(o.command)).append(": ").append(esc(verdict)).append("</title>")
@@ -63,12 +55,12 @@ final class HtmlReport {
         b.append("<p class=\"verdict ").append(ok ? "ok" : "bad").append("\" id=\"verdict\">").append(esc(verdict));
         if (!ok) {
             b.append(interrupted ? ": the run was stopped before its end; the steps below are those it reached"
-                                 : ": see the steps marked FAILED and why");
+                                 : ": see the steps marked FAILED, FAIL or INCONCLUSIVE and why");
         }
         b.append("</p>\n");
         setup(o);
         steps(steps);
-        chart(steps);
+        chart(steps, o.limit());
         transmissions(steps);
         trace(capture);
         b.append("<script type=\"application/json\" id=\"results\">").append(json.replace("</", "<\\/"))
@@ -87,6 +79,13 @@ final class HtmlReport {
         if (o.btsnoop != null) {
             item("Capture", o.btsnoop);
         }
+        item("Verdicts", String.format(Locale.ROOT, "PASS when PER's 95 %% interval lies below %.1f %%, FAIL above it;"
+                                       + " at least %d packets expected", o.limit() * 100, o.minPackets()));
+        if (!o.simulator.isEmpty()) {
+            item("Simulated controller", "loss " + o.simulator.get("loss") + ", reference transmitter "
+                 + (o.simulator.get("reftx").equals("1") ? "on" : "off") + ", loss bursts " + o.simulator.get("burst")
+                 + ", seed " + o.simulator.get("seed") + ", processing delay " + o.simulator.get("delay") + " s");
+        }
         b.append("</dl>\n");
     }
 
@@ -97,7 +96,7 @@ final class HtmlReport {
     private void steps(List<Step> steps) {
         b.append("<h2>Steps</h2>\n<div class=\"wide\"><table id=\"steps\"><thead><tr>");
         for (String h : List.of("Step", "Setting", "Duration", "Received", "Expected", "PER [95 % CI]",
-                                "Controller's answers", "Result")) {
+                                "Controller's answers", "Verdict", "Result")) {
             b.append("<th scope=\"col\">").append(h).append("</th>");
         }
         b.append("</tr></thead><tbody>\n");
@@ -123,7 +122,12 @@ final class HtmlReport {
             b.append("<li title=\"").append(esc(Hci.commandLabel(e.opcode()))).append("\">")
              .append(esc(Hci.commandName(e.opcode()))).append(": ").append(esc(e.statusText())).append("</li>");
         }
-        b.append("</ul></td><td class=\"wrap ").append(s.ok ? "ok" : "bad").append("\">")
+        b.append("</ul></td><td class=\"").append(s.verdict == null ? "" : s.verdict == Step.Verdict.PASS ? "ok" : "bad")
+         .append("\">").append(s.verdict == null ? "-" : s.verdict.toString());
+        if (s.verdictWhy != null) {
+            b.append("<br>").append(esc(s.verdictWhy));
+        }
+        b.append("</td><td class=\"").append(s.ok ? "ok" : "bad").append("\">")
          .append(s.ok ? "ok" : s.interrupted ? "INTERRUPTED" : "FAILED");
         if (s.error != null) {
             b.append("<br>").append(esc(s.error));
@@ -136,7 +140,7 @@ final class HtmlReport {
     }
 
     // PER of each receiver step by channel, one series per PHY, the interval as whiskers.
-    private void chart(List<Step> steps) {
+    private void chart(List<Step> steps, double limit) {
         List<Step> rx = steps.stream().filter(HtmlReport::charted).toList();
         b.append("<h2>Packet error rate</h2>\n");
         if (rx.isEmpty()) {
@@ -148,24 +152,30 @@ final class HtmlReport {
         b.append("<figure><svg id=\"per-chart\" viewBox=\"0 0 ").append(W).append(' ').append(H)
          .append("\" role=\"img\" aria-labelledby=\"per-caption\" xmlns=\"http://www.w3.org/2000/svg\">");
         axes(top, mhz);
-        if (SENSITIVITY_PER <= top) {
-            double y = y(SENSITIVITY_PER, top);
+        String label = String.format(Locale.ROOT, "%.1f %%", limit * 100);
+        if (limit <= top) {
+            double y = y(limit, top);
             b.append(String.format(Locale.ROOT, "<line class=\"limit\" x1=\"%d\" x2=\"%d\" y1=\"%.1f\" y2=\"%.1f\"/>",
                                    LEFT, W - RIGHT, y, y));
-            b.append(String.format(Locale.ROOT, "<text x=\"%d\" y=\"%.1f\" class=\"limit-label\">30.8 %%</text>",
-                                   W - RIGHT - 4, y - 4));
+            b.append(String.format(Locale.ROOT, "<text x=\"%d\" y=\"%.1f\" class=\"limit-label\">%s</text>",
+                                   W - RIGHT - 4, y - 4, label));
         }
         for (int i = 0; i < steps.size(); i++) {
             if (charted(steps.get(i))) {
                 point(i, steps.get(i), top, mhz);
             }
         }
+        List<String> keys = new ArrayList<>();
+        if (rx.stream().anyMatch(s -> s.phy == Phy.LE_1M)) {
+            keys.add("<span class=\"key\" style=\"color:" + BLUE + "\">&#9679; LE 1M</span>");
+        }
+        if (rx.stream().anyMatch(s -> s.phy == Phy.LE_2M)) {
+            keys.add("<span class=\"key\" style=\"color:" + ORANGE + "\">&#9632; LE 2M</span>");
+        }
         b.append("</svg><figcaption id=\"per-caption\">PER per channel with its 95 % interval: ")
-         .append("<span class=\"key\" style=\"color:").append(BLUE).append("\">&#9679; LE 1M</span>, ")
-         .append("<span class=\"key\" style=\"color:").append(ORANGE).append("\">&#9632; LE 2M</span>. ")
-         .append(SENSITIVITY_PER <= top
-                 ? "The dashed line is PER 30.8 %, the level of the receiver sensitivity test."
-                 : "PER 30.8 %, the level of the receiver sensitivity test, lies above this chart's range.")
+         .append(String.join(", ", keys)).append(". ")
+         .append(limit <= top ? "The dashed line is the PER limit of the verdicts, " + label + "."
+                              : "The PER limit of the verdicts, " + label + ", lies above this chart's range.")
          .append(" The values are those of the table above.</figcaption></figure>\n");
     }
 
@@ -318,11 +328,9 @@ final class HtmlReport {
         .verdict{font-weight:bold;padding:.5em .8em;border-left:.5em solid}
         .verdict.ok{border-color:#009E73;background:#e6f5f0}.verdict.bad{border-color:#D55E00;background:#fbeee6}
         dl.setup{display:grid;grid-template-columns:max-content 1fr;gap:.2em 1em}dt{font-weight:bold}dd{margin:0}
-        .wide{overflow-x:auto}table{border-collapse:collapse;font-size:.92em}
-        th,td{border:1px solid #bbb;padding:.3em .5em;text-align:left;vertical-align:top}
-        td{white-space:nowrap}td.wrap{white-space:normal;min-width:14em}
+        .wide{overflow-x:auto}table{border-collapse:collapse;font-size:.88em;width:100%}
+        th,td{border:1px solid #bbb;padding:.3em .4em;text-align:left;vertical-align:top;overflow-wrap:anywhere}
         th{background:#eee}td.ok{color:#00664a;font-weight:bold}td.bad{color:#a33d00;font-weight:bold}
-        td.ok,td.bad{min-width:6em}
         ul.answers{margin:0;padding-left:0;list-style:none;font-size:.92em}
         figure{margin:0}svg{width:100%;max-width:640px;height:auto;font-size:12px}
         .grid{stroke:#ddd}.axis text{fill:#333}.whisker{fill:none;stroke-width:2}

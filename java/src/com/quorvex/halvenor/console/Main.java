@@ -11,8 +11,8 @@ import java.util.Map;
 import java.util.stream.Stream;
 
 public final class Main {
-    static final int EXIT_OK = 0;
-    static final int EXIT_FAILED = 1;
+    static final int EXIT_OK = Report.EXIT_OK;
+    static final int EXIT_FAILED = Report.EXIT_FAILED;
     static final int EXIT_USAGE = 2;
     /** A signal ends the process within 3 s, whatever the controller does. */
     private static final long INTERRUPT_BOUND_MS = 2_500;
@@ -30,17 +30,16 @@ public final class Main {
         Map<String, String> env = System.getenv();
         try {
             o = Options.parse(args);
-            if (!o.command.equals("help")) {
-                o.checkEnvironment(env);
+            if (o.command.equals("help") || o.command.equals("version")) {
+                out.print(o.command.equals("help") ? Usage.text(o.helpFor) : version());
+                return EXIT_OK;
             }
+            o.checkEnvironment(env);
+            o.checkPaths();
         } catch (UsageException e) {
             err.println("halvenor: " + e.getMessage());
             err.println("halvenor: run './halvenor help' for the commands and options");
             return EXIT_USAGE;
-        }
-        if (o.command.equals("help")) {
-            out.print(Usage.text(o.helpFor));
-            return EXIT_OK;
         }
         Path capture = Path.of(env.get("HALVENOR_CONSOLE_CAPTURE"));
         Observer observer = new Observer(capture, Path.of(env.get("HALVENOR_LOG_FILE")));
@@ -52,10 +51,10 @@ public final class Main {
                         + System.getProperty("java.library.path"));
             return EXIT_FAILED;
         }
-        Trace trace = o.trace ? Trace.start(capture, err) : null;
+        Trace trace = o.flag("trace") ? Trace.start(capture, err) : null;
         Progress progress = Progress.forConsole(out);
         Report report = new Report(out, o, progress, capture);
-        Runner runner = new Runner(bench, observer, progress);
+        Runner runner = new Runner(bench, observer, progress, o.limit(), o.minPackets());
         report.start();
         Thread hook = new Thread(() -> interrupted(bench, runner, report, trace, err), "halvenor-interrupt");
         Runtime.getRuntime().addShutdownHook(hook);
@@ -74,7 +73,23 @@ public final class Main {
             trace.stop();
         }
         report.finish(null, null);
-        return report.ok() ? EXIT_OK : EXIT_FAILED;
+        return report.exitStatus();
+    }
+
+    // The console's version, and the commit its library was built from, read from the
+    // library file itself: the library exports no more than the app's natives.
+    private static String version() {
+        String version = Main.class.getPackage().getImplementationVersion();
+        Path library = Path.of(System.getProperty("java.library.path", ".")).resolve("libhalvenor.so");
+        String commit = "unknown";
+        try {
+            String bytes = new String(Files.readAllBytes(library), java.nio.charset.StandardCharsets.ISO_8859_1);
+            java.util.regex.Matcher m = java.util.regex.Pattern.compile("halvenor-build-commit:([0-9a-f+]{4,41})").matcher(bytes);
+            commit = m.find() ? m.group(1) : commit;
+        } catch (IOException e) {
+            commit = "unknown (" + library + " not readable)";
+        }
+        return "halvenor " + (version == null ? "unknown" : version) + "\nlibhalvenor.so built from commit " + commit + "\n";
     }
 
     // A failed step does not stop the run: a sweep goes on to its next setting. Only a

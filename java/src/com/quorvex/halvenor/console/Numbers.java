@@ -1,11 +1,12 @@
-// Parsing of the console's numeric arguments, each failure naming the valid range.
+// Parsing of the console's numbers; each gives null for a text outside its range, and the
+// option's table row names the valid values.
 package com.quorvex.halvenor.console;
 
 final class Numbers {
     private Numbers() {}
 
-    /** Seconds as "1.5", "1.5s" or "500ms": more than 0 (or at least {@code min} when set) and at most {@code max}. */
-    static double seconds(String option, String text, double min, double max) throws UsageException {
+    /** Seconds as "1.5", "1.5s" or "500ms", from min to max (more than 0 when min is 0 and max above 10). */
+    static Double seconds(String text, double min, double max) {
         String t = text.trim().toLowerCase();
         double scale = 1;
         if (t.endsWith("ms")) {
@@ -14,45 +15,38 @@ final class Numbers {
         } else if (t.endsWith("s")) {
             t = t.substring(0, t.length() - 1);
         }
-        double v;
-        try {
-            v = Double.parseDouble(t) * scale;
-        } catch (NumberFormatException e) {
-            v = Double.NaN;
-        }
-        boolean low = min > 0 ? v >= min : v > 0;
-        if (!(low && v <= max)) {
-            String from = min > 0 ? "at least " + fmt(min) : "more than 0";
-            throw new UsageException("bad " + option + " '" + text + "': give seconds, " + from + " and at most "
-                                     + fmt(max) + " (for example 2, 0.5 or 500ms)");
-        }
-        return v;
+        Double v = decimal(t, min / scale, max / scale);
+        return v == null ? null : v * scale;
     }
 
-    /** A byte value, decimal or 0x hexadecimal: 0 to 255. */
-    static int octet(String option, String text) throws UsageException {
-        long v = parse(text.trim());
-        if (v < 0 || v > 255) {
-            throw new UsageException("bad " + option + " '" + text + "': valid values are 0 to 255 (or 0x00 to 0xff)");
+    /** A decimal number from min to max. */
+    static Double decimal(String text, double min, double max) {
+        try {
+            double v = Double.parseDouble(text.trim());
+            return v >= min && v <= max ? v : null;
+        } catch (NumberFormatException e) {
+            return null;
         }
-        return (int) v;
+    }
+
+    /** A whole number from min to max, decimal or (when hex) 0x hexadecimal. */
+    static Integer whole(String text, int min, int max, boolean hex) {
+        long v = parse(text.trim(), hex);
+        return v >= min && v <= max ? (int) v : null;
     }
 
     /** A packet count: 1 or more. */
-    static long count(String option, String text) throws UsageException {
-        long v = parse(text.trim());
-        if (v < 1) {
-            throw new UsageException("bad " + option + " '" + text + "': give the number of packets sent, 1 or more");
-        }
-        return v;
+    static Long count(String text) {
+        long v = parse(text.trim(), true);
+        return v >= 1 ? v : null;
     }
 
-    private static long parse(String t) {
+    private static long parse(String t, boolean hex) {
         try {
-            if (t.startsWith("0x") || t.startsWith("0X")) {
+            if (hex && (t.startsWith("0x") || t.startsWith("0X"))) {
                 return Long.parseLong(t.substring(2), 16);
             }
-            return Long.parseLong(t);
+            return t.matches("[0-9]+") ? Long.parseLong(t) : -1;
         } catch (NumberFormatException e) {
             return -1;
         }

@@ -1,13 +1,21 @@
-// The console's command line: a command, its options and the global options, checked
-// up front so that a bad argument is reported before the controller is touched.
+// The console's command line, parsed by the option table: a command, its options and the
+// global ones, checked up front so that a bad argument is reported before the controller is
+// touched, and the files it names tried before anything runs.
 package com.quorvex.halvenor.console;
 
 import java.io.IOException;
+import java.nio.file.AccessDeniedException;
+import java.nio.file.FileSystemException;
 import java.nio.file.Files;
+import java.nio.file.NoSuchFileException;
+import java.nio.file.NotDirectoryException;
 import java.nio.file.Path;
+import java.nio.file.StandardOpenOption;
 import java.util.ArrayList;
 import java.util.HashMap;
+import java.util.LinkedHashMap;
 import java.util.List;
+import java.util.Locale;
 import java.util.Map;
 import java.util.Set;
 import java.util.TreeSet;
@@ -15,120 +23,92 @@ import java.util.regex.Matcher;
 import java.util.regex.Pattern;
 
 final class Options {
-    static final String HCI_VALUES = "sim, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]";
-    static final double MIN_WINDOW_S = 1;
+    /** The receiver sensitivity limit for 37-byte payloads: PER 30.8 %, a bit error rate of 0.1 %. */
+    static final double DEFAULT_LIMIT_PERCENT = 30.8;
+    static final long DEFAULT_MIN_PACKETS = 1500;
     private static final Pattern HCI = Pattern.compile(
             "sim|none|unix:.+|tcp:[^:]+:([1-9][0-9]{0,4})|tty:([^,]+)((,[^,]+)*)");
     private static final Set<Integer> BAUDS = Set.of(9600, 19200, 38400, 57600, 115200, 230400, 460800, 500000,
                                                      921600, 1000000, 1500000, 2000000, 3000000, 4000000);
-    private static final Set<String> FLAGS = Set.of("verbose", "json", "help", "trace");
-    private static final Set<String> GLOBAL = Set.of("hci", "btsnoop", "verbose", "json", "help", "trace", "report");
-    static final Map<String, Set<String>> COMMAND_OPTIONS = Map.of(
-            "demo", Set.of(),
-            "help", Set.of(),
-            "dut on", Set.of("hold"),
-            "dut off", Set.of(),
-            "tx", Set.of("freq", "phy", "duration"),
-            "rx", Set.of("freq", "phy", "duration", "expected", "window"),
-            "sweep rx", Set.of("duration", "expected", "window"),
-            "sweep tx", Set.of("duration"),
-            "cw", Set.of("channel", "power", "type", "duration"));
-    private static final String COMMANDS = "demo, dut on, dut off, tx, rx, cw, sweep or help";
+    private static final String COMMANDS = "demo, dut on, dut off, tx, rx, sweep, cw, sim or help";
 
-    String command;            // one of the keys of COMMAND_OPTIONS
-    String helpFor;            // with command "help": the command asked about, or null
+    String command;            // a command of the table, or "help" / "version"
+    String helpFor;            // with command "help": the topic asked about, or null
+    List<String> arguments;    // the command line as given
+    private final Map<String, Object> values = new HashMap<>();
     String hci;                // from the launcher's HALVENOR_HCI, or sim
     String btsnoop;            // from the launcher's HALVENOR_BTSNOOP, or null
-    String report;             // the HTML page to write, or null
-    List<String> arguments;    // the command line as given
-    boolean json;
-    boolean verbose;
-    boolean trace;
-    Band band;
-    Phy phy;
-    double seconds = 1;
-    double holdSeconds;
-    double window = Runner.DEFAULT_WINDOW_S;
-    Long expected;
-    int channel;
-    int power;
-    int type;
+    /** The simulated controller's settings, as the host layer reads them, when it is the controller. */
+    final Map<String, String> simulator = new LinkedHashMap<>();
 
     static Options parse(String[] args) throws UsageException {
-        Map<String, String> values = new HashMap<>();
+        Options o = new Options();
+        o.arguments = List.of(args);
+        Map<String, String> given = new HashMap<>();
         List<String> words = new ArrayList<>();
         for (int i = 0; i < args.length; i++) {
-            String a = args[i];
-            if (a.equals("-h")) {
-                a = "--help";
-            }
+            String a = args[i].equals("-h") ? "--help" : args[i];
             if (!a.startsWith("-") || a.equals("-")) {
                 words.add(a);
                 continue;
             }
             int eq = a.indexOf('=');
-            String name = a.startsWith("--") ? a.substring(2, eq < 0 ? a.length() : eq) : a;
-            if (!known(name)) {
+            String name = a.substring(a.startsWith("--") ? 2 : 1, eq < 0 ? a.length() : eq);
+            boolean meta = name.equals("help") || name.equals("version");
+            Option opt = Option.named(name);
+            if (opt == null && !meta) {
                 throw new UsageException("unknown option '" + (eq < 0 ? a : a.substring(0, eq)) + "'");
             }
-            if (values.containsKey(name)) {
+            if (given.containsKey(name)) {
                 throw new UsageException("option --" + name + " given twice");
             }
-            String value;
-            if (FLAGS.contains(name)) {
-                if (eq >= 0) {
-                    throw new UsageException("option --" + name + " takes no value");
-                }
-                value = "";
-            } else if (eq >= 0) {
-                value = a.substring(eq + 1);
-            } else if (i + 1 < args.length) {
-                value = args[++i];
-            } else {
-                throw new UsageException("option --" + name + " needs a value");
+            if ((meta || opt.flag()) && eq >= 0) {
+                throw new UsageException("option --" + name + " takes no value");
             }
-            values.put(name, value);
+            String value = "";
+            if (!meta && !opt.flag()) {
+                value = eq >= 0 ? a.substring(eq + 1) : i + 1 < args.length && !args[i + 1].startsWith("-") ? args[++i] : null;
+                if (value == null || value.isEmpty()) {
+                    throw new UsageException("option --" + name + " needs a value (" + opt.value() + "); a value that starts"
+                                             + " with '-' is written --" + name + "=VALUE");
+                }
+            }
+            given.put(name, value);
         }
-        Options o = new Options();
-        o.arguments = List.of(args);
-        if (words.isEmpty() && values.containsKey("help")) {
+        if (given.containsKey("version")) {
+            o.command = "version";
+            return o;
+        }
+        if (given.containsKey("help") || (!words.isEmpty() && words.get(0).equals("help"))) {
             o.command = "help";
+            o.helpFor = topic(words.isEmpty() || !words.get(0).equals("help") ? words : words.subList(1, words.size()));
             return o;
         }
         o.command = command(words);
-        if (o.command.equals("help") || values.containsKey("help")) {
-            o.helpFor = o.command.equals("help") ? helpTopic(words) : o.command;
-            o.command = "help";
-            return o;
-        }
-        o.apply(values);
+        o.apply(given);
         return o;
     }
 
-    private static boolean known(String name) {
-        return GLOBAL.contains(name) || COMMAND_OPTIONS.values().stream().anyMatch(s -> s.contains(name));
-    }
-
+    // The command the words name: "dut on", "sweep tx", "rx", ...
     private static String command(List<String> words) throws UsageException {
         if (words.isEmpty()) {
             throw new UsageException("no command given: use " + COMMANDS);
         }
         String first = words.get(0);
+        String second = words.size() > 1 ? words.get(1) : null;
+        boolean mode = "rx".equals(second) || "tx".equals(second);
         String command;
         int used = 1;
         if (first.equals("dut")) {
-            if (words.size() < 2 || !(words.get(1).equals("on") || words.get(1).equals("off"))) {
+            if (!"on".equals(second) && !"off".equals(second)) {
                 throw new UsageException("dut needs 'on' or 'off'");
             }
-            command = "dut " + words.get(1);
+            command = "dut " + second;
             used = 2;
         } else if (first.equals("sweep")) {
-            boolean mode = words.size() > 1 && (words.get(1).equals("rx") || words.get(1).equals("tx"));
-            command = "sweep " + (mode ? words.get(1) : "rx");
+            command = "sweep " + (mode ? second : "rx");
             used = mode ? 2 : 1;
-        } else if (first.equals("help")) {
-            return "help";
-        } else if (COMMAND_OPTIONS.containsKey(first)) {
+        } else if (Option.command(first) != null && !first.equals("help")) {
             command = first;
         } else {
             throw new UsageException("unknown command '" + first + "': use " + COMMANDS);
@@ -136,77 +116,98 @@ final class Options {
         if (words.size() > used) {
             throw new UsageException("unexpected argument '" + words.get(used) + "' after " + command);
         }
+        if (command.equals("sim")) {
+            throw new UsageException("sim runs through the launcher: ./halvenor sim");
+        }
         return command;
     }
 
-    // "help", "help rx", "help dut on", "help sweep tx".
-    private static String helpTopic(List<String> words) throws UsageException {
-        if (words.size() < 2) {
+    // "", "rx", "dut", "dut on", "sweep", "sweep tx", "sim": the page to show, null for all.
+    private static String topic(List<String> words) throws UsageException {
+        if (words.isEmpty()) {
             return null;
         }
-        List<String> rest = words.subList(1, words.size());
-        String topic = command(rest);
-        return topic.equals("help") ? null : topic;
+        String joined = String.join(" ", words);
+        if (joined.equals("dut") || joined.equals("sweep") || joined.equals("sim") || joined.equals("help")) {
+            return joined;
+        }
+        return command(words);
     }
 
-    private void apply(Map<String, String> values) throws UsageException {
-        Set<String> allowed = COMMAND_OPTIONS.get(command);
-        for (String name : values.keySet()) {
-            if (!GLOBAL.contains(name) && !allowed.contains(name)) {
-                throw new UsageException("option --" + name + " does not apply to " + command + " (its options: "
-                                         + optionList(allowed) + ")");
+    private void apply(Map<String, String> given) throws UsageException {
+        for (Map.Entry<String, String> e : given.entrySet()) {
+            Option opt = Option.named(e.getKey());
+            if (!opt.commands().contains(command)) {
+                throw new UsageException("option --" + opt.name() + " does not apply to " + command + " (its options: "
+                                         + optionList(command) + ")");
+            }
+            values.put(opt.name(), opt.parse(e.getValue()));
+        }
+        for (Option opt : Option.ALL) {
+            if (opt.requiredBy().contains(command) && !values.containsKey(opt.name())) {
+                throw new UsageException(command + " needs --" + opt.name() + " (" + opt.range() + ")");
             }
         }
-        json = values.containsKey("json");
-        verbose = values.containsKey("verbose");
-        trace = values.containsKey("trace");
-        hci = values.get("hci");
-        if (hci != null) {
-            checkHci("--hci", hci);
-        }
-        btsnoop = values.get("btsnoop");
-        report = values.get("report");
-        if (report != null) {
-            checkReport(report);
-        }
-        if (command.equals("tx") || command.equals("rx")) {
-            band = Band.parse(require(values, "freq", "2402, 2440 or 2480"));
-            phy = Phy.parse(require(values, "phy", "1M or 2M"));
-        }
-        if (values.containsKey("duration")) {
-            seconds = Numbers.seconds("--duration", values.get("duration"), 0, 24 * 3600);
-        }
-        if (values.containsKey("hold")) {
-            holdSeconds = Numbers.seconds("--hold", values.get("hold"), 0, 24 * 3600);
-        }
-        if (values.containsKey("window")) {
-            window = Numbers.seconds("--window", values.get("window"), MIN_WINDOW_S, Runner.MAX_WINDOW_S);
-        }
-        if (values.containsKey("expected")) {
-            expected = Numbers.count("--expected", values.get("expected"));
-        }
-        if (command.equals("cw")) {
-            channel = Numbers.octet("--channel", require(values, "channel", "0 to 255"));
-            power = Numbers.octet("--power", require(values, "power", "0 to 255"));
-            type = Numbers.octet("--type", require(values, "type", "0 to 255"));
-        }
     }
 
-    static String optionList(Set<String> options) {
-        return options.isEmpty() ? "none besides the global ones" : "--" + String.join(", --", new TreeSet<>(options));
+    static String optionList(String command) {
+        TreeSet<String> names = new TreeSet<>();
+        for (Option o : Option.ALL) {
+            if (o.commands().contains(command)) {
+                names.add("--" + o.name());
+            }
+        }
+        return names.isEmpty() ? "none" : String.join(", ", names);
+    }
+
+    boolean flag(String name) {
+        return values.containsKey(name);
+    }
+
+    String text(String name) {
+        return (String) values.get(name);
+    }
+
+    double seconds(String name, double fallback) {
+        Object v = values.get(name);
+        return v == null ? fallback : (Double) v;
+    }
+
+    Band band() {
+        return (Band) values.get("freq");
+    }
+
+    Phy phy() {
+        return (Phy) values.get("phy");
+    }
+
+    Long expected() {
+        return (Long) values.get("expected");
+    }
+
+    int octet(String name) {
+        return (Integer) values.get(name);
+    }
+
+    /** The verdict's PER limit, a fraction. */
+    double limit() {
+        Object v = values.get("limit");
+        return (v == null ? DEFAULT_LIMIT_PERCENT : (Double) v) / 100;
+    }
+
+    long minPackets() {
+        Object v = values.get("min-packets");
+        return v == null ? DEFAULT_MIN_PACKETS : (Long) v;
     }
 
     /** The controller values the host layer takes; `none` stands for a device without the HAL. */
-    private static void checkHci(String source, String value) throws UsageException {
+    static String checkHci(String source, String value) throws UsageException {
         Matcher m = HCI.matcher(value);
         if (!m.matches() || (m.group(1) != null && Integer.parseInt(m.group(1)) > 65535)) {
-            throw new UsageException("bad " + source + " '" + value + "': valid values are " + HCI_VALUES);
+            throw new UsageException("bad " + source + " '" + value + "': expected " + Option.named("hci").range());
         }
         String fields = m.group(3);
-        if (fields == null || fields.isEmpty()) {
-            return;
-        }
-        for (String field : fields.substring(1).split(",")) {
+        for (String field : fields == null || fields.isEmpty() ? new String[0] : fields.substring(1).split(",")) {
             if (field.equals("rtscts") || (field.matches("[0-9]{1,7}") && BAUDS.contains(Integer.parseInt(field)))) {
                 continue;
             }
@@ -214,18 +215,11 @@ final class Options {
                     ? "baud rate " + field + " is not a standard speed (" + standardSpeeds() + ")"
                     : "'" + field + "' is neither a baud rate nor rtscts"));
         }
+        return value;
     }
 
     private static String standardSpeeds() {
         return String.join(", ", new TreeSet<>(BAUDS).stream().map(String::valueOf).toList());
-    }
-
-    private String require(Map<String, String> values, String name, String valid) throws UsageException {
-        String v = values.get(name);
-        if (v == null) {
-            throw new UsageException(command + " needs --" + name + " (" + valid + ")");
-        }
-        return v;
     }
 
     /**
@@ -239,54 +233,83 @@ final class Options {
         }
         String envHci = env.getOrDefault("HALVENOR_HCI", "");
         envHci = envHci.isEmpty() ? "sim" : envHci;
-        if (hci != null && !hci.equals(envHci)) {
-            throw new UsageException("--hci " + hci + " must be given to the ./halvenor launcher, which sets HALVENOR_HCI"
+        String given = text("hci");
+        if (given != null && !given.equals(envHci)) {
+            throw new UsageException("--hci " + given + " must be given to the ./halvenor launcher, which sets HALVENOR_HCI"
                                      + " (the library sees '" + envHci + "')");
         }
-        checkHci(hci != null ? "--hci" : "HALVENOR_HCI", envHci);
-        hci = envHci;
+        hci = checkHci(given != null ? "--hci" : "HALVENOR_HCI", envHci);
         String envSnoop = env.get("HALVENOR_BTSNOOP");
-        if (btsnoop != null && !btsnoop.equals(envSnoop)) {
-            throw new UsageException("--btsnoop " + btsnoop + " must be given to the ./halvenor launcher,"
+        if (text("btsnoop") != null && !text("btsnoop").equals(envSnoop)) {
+            throw new UsageException("--btsnoop " + text("btsnoop") + " must be given to the ./halvenor launcher,"
                                      + " which sets HALVENOR_BTSNOOP");
         }
         btsnoop = envSnoop == null || envSnoop.isEmpty() ? null : envSnoop;
-        if (btsnoop != null) {
-            checkCapture(btsnoop);
-        }
-    }
-
-    /** The page is written at the end of the run, replacing a file of that name. */
-    private static void checkReport(String path) throws UsageException {
-        Path file = Path.of(path);
-        Path dir = file.toAbsolutePath().getParent();
-        if (Files.isDirectory(file)) {
-            throw new UsageException("bad --report '" + path + "': it is a directory");
-        }
-        boolean writable = Files.exists(file) ? Files.isWritable(file) : dir != null && Files.isWritable(dir);
-        if (!writable) {
-            throw new UsageException("bad --report '" + path + "': cannot write there");
-        }
-    }
-
-    /** Records are appended to an existing capture; anything else in its place is refused. */
-    private static void checkCapture(String path) throws UsageException {
-        Path file = Path.of(path);
-        Path dir = file.toAbsolutePath().getParent();
-        try {
-            if (Files.isDirectory(file)) {
-                throw new UsageException("bad --btsnoop '" + path + "': it is a directory");
+        if (hci.equals("sim")) {
+            String[][] settings = {{"reftx", "1"}, {"loss", "0"}, {"burst", "1"}, {"seed", "0"}, {"delay", "0"}};
+            for (String[] setting : settings) {
+                String v = env.getOrDefault("HALVENOR_SIM_" + setting[0].toUpperCase(Locale.ROOT), "");
+                simulator.put(setting[0], v.isEmpty() ? setting[1] : v);
             }
-            if (Files.exists(file) && !Capture.appendable(file)) {
-                throw new UsageException("bad --btsnoop '" + path + "': the file exists and is not a btsnoop capture"
+        }
+    }
+
+    /**
+     * Every file the run will write is tried now, before anything runs: the capture is
+     * opened for appending (created when missing), the page and the CSV, written at the end
+     * to a file beside them and renamed, by creating that file and opening what is there.
+     */
+    void checkPaths() throws UsageException {
+        if (btsnoop != null) {
+            tryAppend("--btsnoop", Path.of(btsnoop));
+        }
+        for (String name : List.of("report", "csv")) {
+            if (text(name) != null) {
+                tryReplace("--" + name, Path.of(text(name)));
+            }
+        }
+    }
+
+    private static void tryAppend(String option, Path file) throws UsageException {
+        try {
+            Files.newByteChannel(file, StandardOpenOption.CREATE, StandardOpenOption.WRITE, StandardOpenOption.APPEND).close();
+            if (!Capture.appendable(file)) {
+                throw new UsageException("bad " + option + " '" + file + "': the file exists and is not a btsnoop capture"
                                          + " (it would be appended to; give a new file)");
             }
-            boolean writable = Files.exists(file) ? Files.isWritable(file) : dir != null && Files.isWritable(dir);
-            if (!writable) {
-                throw new UsageException("bad --btsnoop '" + path + "': cannot write there");
-            }
         } catch (IOException e) {
-            throw new UsageException("bad --btsnoop '" + path + "': " + e.getMessage());
+            throw new UsageException("bad " + option + " '" + file + "': " + reason(e));
         }
+    }
+
+    private static void tryReplace(String option, Path file) throws UsageException {
+        try {
+            if (Files.isDirectory(file)) {
+                throw new UsageException("bad " + option + " '" + file + "': it is a directory");
+            }
+            if (Files.exists(file)) {
+                Files.newByteChannel(file, StandardOpenOption.WRITE).close();
+            }
+            Files.delete(Replacement.create(file));
+        } catch (IOException e) {
+            throw new UsageException("bad " + option + " '" + file + "': " + reason(e));
+        }
+    }
+
+    // The system's words for why a file could not be opened or created.
+    static String reason(IOException e) {
+        if (e instanceof NoSuchFileException) {
+            return "No such file or directory";
+        }
+        if (e instanceof AccessDeniedException) {
+            return "Permission denied";
+        }
+        if (e instanceof NotDirectoryException) {
+            return "Not a directory";
+        }
+        if (e instanceof FileSystemException f && f.getReason() != null) {
+            return f.getReason();
+        }
+        return e.getMessage();
     }
 }

@@ -18,13 +18,14 @@ enum Phy {
         this.rxOpcode = rxOpcode;
     }
 
-    static Phy parse(String text) throws UsageException {
+    /** The PHY of "2M" or "LE 2M", or null. */
+    static Phy parse(String text) {
         String t = text.trim().toUpperCase().replace("LE", "").trim();
         for (Phy p : values()) {
             if (t.equals(p.name)) {
                 return p;
             }
         }
-        throw new UsageException("bad --phy '" + text + "': valid values are 1M, 2M");
+        return null;
     }
 }

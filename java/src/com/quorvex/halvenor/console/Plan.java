@@ -5,7 +5,8 @@ import java.util.ArrayList;
 import java.util.List;
 
 final class Plan {
-    static final double DEMO_RX_SECONDS = 0.5;
+    /** 1600 packets a second from the reference transmitter: a second is enough for a verdict. */
+    static final double DEMO_RX_SECONDS = 1;
     static final double DEMO_CW_SECONDS = 0.5;
     /** The demo's continuous wave: channel 1, power 9, type 4. */
     static final int[] DEMO_CW = {1, 9, 4};
@@ -18,14 +19,16 @@ final class Plan {
 
     static List<Item> of(Options o) {
         List<Item> items = new ArrayList<>();
+        double seconds = o.seconds("duration", 1);
+        double window = o.seconds("window", Runner.DEFAULT_WINDOW_S);
         switch (o.command) {
-            case "dut on" -> items.add(r -> r.dutOn(o.holdSeconds));
+            case "dut on" -> items.add(r -> r.dutOn(o.seconds("hold", 0)));
             case "dut off" -> items.add(Runner::dutOff);
-            case "tx" -> items.add(r -> r.tx(o.band, o.phy, o.seconds));
-            case "rx" -> items.add(r -> r.rx(o.band, o.phy, o.seconds, o.expected, o.window));
-            case "cw" -> items.add(r -> r.cw(o.channel, o.power, o.type, o.seconds));
-            case "sweep rx" -> sweep(items, true, o.seconds, o.expected, o.window);
-            case "sweep tx" -> sweep(items, false, o.seconds, null, o.window);
+            case "tx" -> items.add(r -> r.tx(o.band(), o.phy(), seconds));
+            case "rx" -> items.add(r -> r.rx(o.band(), o.phy(), seconds, o.expected(), window));
+            case "cw" -> items.add(r -> r.cw(o.octet("channel"), o.octet("power"), o.octet("type"), seconds));
+            case "sweep rx" -> sweep(items, true, seconds, o.expected(), window);
+            case "sweep tx" -> sweep(items, false, seconds, null, window);
             case "demo" -> demo(items);
             default -> throw new IllegalArgumentException(o.command);
         }

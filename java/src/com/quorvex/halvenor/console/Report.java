@@ -1,18 +1,25 @@
-// Prints the results: a table for people, row by row as each step finishes, or one JSON
-// object for scripts. The main thread adds steps; the interrupt hook may finish the
-// report instead, with the step it interrupted; whoever finishes first prints the end.
+// Prints the results: a table for people, 80 columns wide, row by row as each step
+// finishes, or one JSON object for scripts; and at the end the CSV and the HTML page when
+// asked for. The main thread adds steps; the interrupt hook may finish the report instead,
+// with the step it interrupted; whoever finishes first prints the end.
 package com.quorvex.halvenor.console;
 
 import java.io.IOException;
 import java.io.PrintStream;
 import java.nio.file.Path;
 import java.util.ArrayList;
+import java.util.LinkedHashMap;
 import java.util.List;
 import java.util.Locale;
+import java.util.Map;
 
 final class Report {
-    private static final String[] HEADER = {"STEP", "SETTING", "TIME", "RECEIVED", "EXPECTED", "PER [95% CI]", "RESULT"};
-    private static final int[] WIDTH = {9, 35, 8, 18, 14, 22, 0};
+    static final int EXIT_OK = 0;
+    static final int EXIT_FAILED = 1;
+    static final int EXIT_LIMIT = 3;
+    static final int EXIT_INCONCLUSIVE = 4;
+    private static final String[] HEADER = {"STEP", "SETTING", "COUNT", "PER [95% CI]", "VERDICT", "RESULT"};
+    private static final int[] WIDTH = {8, 20, 7, 21, 13, 0};
 
     private final PrintStream out;
     private final Options o;
@@ -31,7 +38,7 @@ final class Report {
 
     void start() {
         synchronized (out) {
-            if (!o.json) {
+            if (!o.flag("json")) {
                 out.println("halvenor " + o.command + " (controller: " + o.hci
                             + (o.btsnoop == null ? "" : ", capture: " + o.btsnoop) + ")");
                 out.println(line(HEADER));
@@ -47,7 +54,7 @@ final class Report {
                 return;
             }
             steps.add(s);
-            if (!o.json) {
+            if (!o.flag("json")) {
                 progress.clear();
                 out.println(line(row(s)));
                 out.flush();
@@ -70,52 +77,86 @@ final class Report {
                 add(interrupted);
             }
             finished = true;
-            if (o.json) {
+            if (o.flag("json")) {
                 out.println(json());
             } else {
-                summary(interrupted != null);
+                notes();
+                out.println(outcome());
             }
             out.flush();
-            writeHtml();
+            write("csv", () -> Csv.of(steps, o.limit(), o.minPackets()));
+            write("report", () -> HtmlReport.page(o, steps, json(), capture, outcome(), exitStatus() == EXIT_OK));
         }
     }
 
-    /** Every step ok, and the page written when one was asked for. */
-    boolean ok() {
+    /** The most severe outcome: a step that could not run, then a limit failed, then an inconclusive verdict. */
+    int exitStatus() {
         synchronized (out) {
-            return written && steps.stream().allMatch(s -> s.ok);
+            if (!written || steps.stream().anyMatch(s -> !s.ok)) {
+                return EXIT_FAILED;
+            }
+            if (steps.stream().anyMatch(s -> s.verdict == Step.Verdict.FAIL)) {
+                return EXIT_LIMIT;
+            }
+            return steps.stream().anyMatch(s -> s.verdict == Step.Verdict.INCONCLUSIVE) ? EXIT_INCONCLUSIVE : EXIT_OK;
         }
     }
 
-    // A page asked for and not written is a failure of the run, said in one line.
-    private void writeHtml() {
-        if (o.report == null) {
+    interface Content {
+        String make() throws IOException;
+    }
+
+    // A file asked for and not written is a failure of the run, said in one line.
+    private void write(String option, Content content) {
+        String file = o.text(option);
+        if (file == null) {
             return;
         }
         try {
-            HtmlReport.write(Path.of(o.report), o, steps, json(), capture);
+            Replacement.write(Path.of(file), content.make());
         } catch (IOException e) {
             written = false;
-            System.err.println("halvenor: the report " + o.report + " was not written: " + e.getMessage());
+            System.err.println("halvenor: the " + option + " file " + file + " was not written: " + Options.reason(e));
         }
     }
 
-    private void summary(boolean interrupted) {
+    private void notes() {
         for (Step s : steps) {
             if (!s.ok) {
                 out.println((s.interrupted ? "" : "FAILED ") + s.name + " " + s.setting + ": " + s.error);
-            } else if (s.timingTooUncertain()) {
-                out.println(String.format(Locale.ROOT, "%s %s: timing too uncertain to judge PER: the replies took"
-                                          + " %.3f s of a %.3f s window", s.name, s.setting,
-                                          s.uncertaintyMicros() / 1e6, s.windowMicros / 1e6));
+            } else if (s.verdictWhy != null) {
+                out.println(s.verdict + " " + s.name + " " + s.label() + ": " + s.verdictWhy);
             }
         }
+    }
+
+    /** "all 9 steps ok (6 PASS)", "2 of 9 steps failed (...)", "interrupted after 1 step ok". */
+    String outcome() {
         long ok = steps.stream().filter(s -> s.ok).count();
-        if (interrupted) {
-            out.println("interrupted after " + ok + " step" + (ok == 1 ? "" : "s") + " ok");
-        } else {
-            out.println(ok == steps.size() ? "all " + ok + " steps ok" : (steps.size() - ok) + " of " + steps.size() + " steps failed");
+        Map<Step.Verdict, Integer> counted = verdicts();
+        List<String> parts = new ArrayList<>();
+        counted.forEach((v, n) -> parts.add(n + " " + v));
+        String verdicts = parts.isEmpty() ? "" : " (" + String.join(", ", parts) + ")";
+        if (steps.stream().anyMatch(s -> s.interrupted)) {
+            return "interrupted after " + plural(ok, "step") + " ok" + verdicts;
         }
+        return (ok == steps.size() ? (ok == 1 ? "" : "all ") + plural(ok, "step") + " ok"
+                                   : (steps.size() - ok) + " of " + plural(steps.size(), "step") + " failed") + verdicts;
+    }
+
+    private Map<Step.Verdict, Integer> verdicts() {
+        Map<Step.Verdict, Integer> counted = new LinkedHashMap<>();
+        for (Step.Verdict v : Step.Verdict.values()) {
+            int n = (int) steps.stream().filter(s -> s.verdict == v).count();
+            if (n > 0) {
+                counted.put(v, n);
+            }
+        }
+        return counted;
+    }
+
+    static String plural(long n, String word) {
+        return n + " " + word + (n == 1 ? "" : "s");
     }
 
     private static String line(String[] cells) {
@@ -128,20 +169,14 @@ final class Report {
 
     private static String[] row(Step s) {
         synchronized (s) {
-            return rowLocked(s);
+            String count = s.received == null ? "-" : s.received.toString();
+            String per = s.received != null && s.received == 0 ? "no transmitter heard"
+                         : s.per == null ? "-" : String.format(Locale.ROOT, "%.1f%% [%.1f-%.1f%%]", s.per.rate() * 100,
+                                                               s.per.low() * 100, s.per.high() * 100);
+            String verdict = s.verdict == null ? "-" : s.verdict.toString();
+            String result = s.ok ? "ok" : s.interrupted ? "INTERRUPTED" : "FAILED";
+            return new String[] {s.name, s.label(), count, per, verdict, result};
         }
-    }
-
-    private static String[] rowLocked(Step s) {
-        String time = Double.isNaN(s.seconds) ? "-" : String.format(Locale.ROOT, "%.2f s", s.seconds);
-        String received = s.received == null ? "-" : s.received.toString();
-        if (s.windows.size() > 1) {
-            received += " (" + s.windows.size() + " windows)";
-        }
-        String expected = s.expected == null ? "-" : s.expected + (s.expectedGiven != null ? " (given)" : "");
-        String per = s.per == null ? "-" : s.per.percent();
-        String result = s.ok ? "ok" : s.interrupted ? "INTERRUPTED" : "FAILED";
-        return new String[] {s.name, s.setting, time, received, expected, per, result};
     }
 
     private static String pad(String text, int width) {
@@ -153,9 +188,19 @@ final class Report {
         b.append("\"command\":").append(quote(o.command));
         b.append(",\"hci\":").append(quote(o.hci));
         b.append(",\"btsnoop\":").append(o.btsnoop == null ? "null" : quote(o.btsnoop));
+        if (!o.simulator.isEmpty()) {
+            b.append(",\"simulator\":{");
+            o.simulator.forEach((k, v) -> b.append(b.charAt(b.length() - 1) == '{' ? "" : ",").append(quote(k))
+                                           .append(':').append(v.matches("[0-9]+(\\.[0-9]+)?") ? v : quote(v)));
+            b.append('}');
+        }
+        b.append(",\"limit\":{\"per\":").append(num(o.limit())).append(",\"min_packets\":").append(o.minPackets()).append('}');
         b.append(",\"ok\":").append(!steps.isEmpty() && steps.stream().allMatch(s -> s.ok));
         b.append(",\"interrupted\":").append(steps.stream().anyMatch(s -> s.interrupted));
-        b.append(",\"steps\":[");
+        b.append(",\"verdicts\":{");
+        verdicts().forEach((v, n) -> b.append(b.charAt(b.length() - 1) == '{' ? "" : ",").append(quote(v.toString()))
+                                       .append(':').append(n));
+        b.append("},\"steps\":[");
         for (int i = 0; i < steps.size(); i++) {
             b.append(i == 0 ? "" : ",").append(step(steps.get(i)));
         }
@@ -186,7 +231,8 @@ final class Report {
             b.append(",\"duration_s\":").append(num(s.seconds));
         }
         if (s.received != null) {
-            b.append(",\"windows\":").append(s.windows);
+            b.append(",\"windows\":").append(s.windows.stream().map(w -> String.valueOf(w.count())).toList()
+                                              .toString().replace(" ", ""));
             b.append(",\"received\":").append(s.received);
             b.append(",\"expected\":").append(s.expected);
             b.append(",\"expected_given\":").append(s.expectedGiven != null);
@@ -200,6 +246,8 @@ final class Report {
             } else {
                 b.append(",\"per\":null,\"per_ci95\":null");
             }
+            b.append(",\"verdict\":").append(s.verdict == null ? "null" : quote(s.verdict.toString()));
+            b.append(",\"verdict_reason\":").append(s.verdictWhy == null ? "null" : quote(s.verdictWhy));
         }
         b.append(",\"commands\":[");
         for (int i = 0; i < s.commands.size(); i++) {

@@ -23,13 +23,17 @@ final class Runner {
     private final Bench bench;
     private final Observer observer;
     private final Progress progress;
+    private final double limit;
+    private final long minPackets;
     private volatile Step current;
     private volatile Observer.Mark window;
 
-    Runner(Bench bench, Observer observer, Progress progress) {
+    Runner(Bench bench, Observer observer, Progress progress, double limit, long minPackets) {
         this.bench = bench;
         this.observer = observer;
         this.progress = progress;
+        this.limit = limit;
+        this.minPackets = minPackets;
     }
 
     /** The step running now, or null between steps. */
@@ -105,7 +109,7 @@ final class Runner {
                 return s;
             }
         }
-        String impossible = Windows.judge(s);
+        String impossible = Windows.judge(s, limit, minPackets);
         return impossible == null ? s : s.fail(impossible);
     }
 
@@ -145,7 +149,7 @@ final class Runner {
             Observer.Mark w = window;
             if (s.name.equals("rx") && end != null && end.packets() != null && w != null) {
                 count(s, w, end.packets());
-                Windows.judge(s);
+                Windows.judge(s, limit, minPackets);
             }
             s.interrupt(why);
         }

@@ -15,8 +15,14 @@ final class Step {
     double seconds = Double.NaN;
     /** Where the step began in what the console observed. */
     volatile Observer.Mark mark;
-    /** The count of each receiver window, in order. */
-    final List<Integer> windows = new ArrayList<>();
+    /** A receiver verdict against the PER limit. */
+    enum Verdict { PASS, FAIL, INCONCLUSIVE }
+
+    /** One counting window: the controller's count, and its window as timed, at its shortest and longest. */
+    record Window(int count, long micros, long shortestMicros, long longestMicros, long startMicros) {}
+
+    /** Each receiver window, in order. */
+    final List<Window> windows = new ArrayList<>();
     /** The controller's counting windows, summed: as timed, and at their shortest and longest. */
     long windowMicros;
     long shortestMicros;
@@ -28,6 +34,10 @@ final class Step {
     long expectedLow;
     long expectedHigh;
     Per per;
+    Verdict verdict;
+    String verdictWhy;        // why a verdict is not PASS, or null
+    /** When the step began, from the wall clock. */
+    final long startMillis = System.currentTimeMillis();
     /** Every command of the step, with the controller's answer. */
     List<Observer.Exchange> commands = List.of();
     volatile boolean ok;
@@ -39,6 +49,17 @@ final class Step {
     Step(String name, String setting) {
         this.name = name;
         this.setting = setting;
+    }
+
+    /** The setting as the 80-column table shows it. */
+    String label() {
+        if (band != null) {
+            return band.mhz + " MHz LE " + phy.name;
+        }
+        if (wave != null) {
+            return "ch " + wave[0] + " pw " + wave[1] + " type " + wave[2];
+        }
+        return name.equals("dut on") ? "DUT mode" : setting;
     }
 
     synchronized Step fail(String why) {

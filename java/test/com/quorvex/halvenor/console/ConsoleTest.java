@@ -102,6 +102,17 @@ class ConsoleTest {
                 .map(p -> "01 " + HexFormat.ofDelimiter(" ").withUpperCase().formatHex(p.bytes())).toList();
     }
 
+    /** Whether the capture shows the command within 30 s. */
+    private static boolean sent(Path capture, String command) throws InterruptedException {
+        return Child.waitUntil(() -> {
+            try {
+                return commands(capture).contains(command);
+            } catch (IOException e) {
+                return false; // its header still being written
+            }
+        }, 30);
+    }
+
     private static void assertNoLibraryLog(Child c) {
         assertFalse(c.stderr().contains("halvenor I ") || c.stderr().contains("halvenor E "),
                     "library log lines hidden without --verbose: " + c.stderr());
@@ -118,7 +129,9 @@ class ConsoleTest {
         List<String> rows = out.lines().filter(l -> l.matches("^(dut on|dut off|rx|cw) .*")).toList();
         assertEquals(9, rows.size(), out);
         assertTrue(rows.stream().allMatch(r -> r.endsWith(" ok")), out);
-        assertTrue(out.contains("all 9 steps ok"), out);
+        assertEquals(6, rows.stream().filter(r -> r.contains(" PASS ")).count(), out);
+        assertTrue(out.lines().allMatch(l -> l.length() <= 80), "the table fits 80 columns: " + out);
+        assertTrue(out.contains("all 9 steps ok (6 PASS)"), out);
         assertFalse(out.contains("\r") || out.contains("\033"), "no progress display off a terminal");
         assertNoLibraryLog(c);
     }
@@ -134,11 +147,14 @@ class ConsoleTest {
     @CsvSource({"0.1,0,3,1,false", "0,0.05,3,3,false", "0,0.6,1,1,true"})
     void perIntervalHoldsTheTrueLoss(double loss, String delay, int seconds, int window, boolean uncertain) throws Exception {
         Path snoop = fresh("windows.btsnoop");
-        Child c = Child.run(command(List.of("--btsnoop", snoop.toString(), "--json", "rx", "--freq", "2480", "--phy", "2M",
-                                            "--duration", "" + seconds, "--window", "" + window)),
-                            environment("HALVENOR_SIM_LOSS", "" + loss, "HALVENOR_SIM_DELAY", delay), 120);
+        Path page = fresh("windows.html");
+        Child c = Child.run(command(List.of("--btsnoop", snoop.toString(), "--report", page.toString(), "--json", "rx", "--freq",
+                                            "2480", "--phy", "2M", "--duration", "" + seconds, "--window", "" + window)),
+                            environment("HALVENOR_SIM_LOSS", "" + loss, "HALVENOR_SIM_DELAY", delay, "HALVENOR_SIM_SEED", "11"), 120);
 
-        assertEquals(0, c.status(), c.stderr());
+        assertTrue(c.status() == 0 || c.status() == 4, c.stderr());  // short windows: too few packets for a verdict
+        String caption = Files.readString(page).replaceAll("(?s).*<figcaption id=\"per-caption\">(.*?)</figcaption>.*", "$1");
+        assertTrue(caption.contains("LE 2M") && !caption.contains("LE 1M"), "the caption keys only the PHYs shown: " + caption);
         Map<String, Object> step = steps(c).get(0);
         List<String> sent = new ArrayList<>();
         for (int i = 0; i < seconds / window; i++) {
@@ -183,7 +199,7 @@ class ConsoleTest {
 
     @Test
     void verboseShowsLibraryLogLinesAndTraceDecodesTheTraffic() throws Exception {
-        Child c = halvenor("--verbose", "--trace", "rx", "--freq", "2440", "--phy", "2M", "--duration", "0.2");
+        Child c = halvenor("--verbose", "--trace", "rx", "--freq", "2440", "--phy", "2M", "--duration", "0.2", "--min-packets", "100");
 
         assertEquals(0, c.status(), c.stderr());
         for (String line : List.of("sendBleTestCommand, init smd successful",
@@ -250,7 +266,8 @@ class ConsoleTest {
             Child c = Child.run(command(concat(List.of("--json", "--hci", controller.hci()), args)), environment(), 60);
             double took = (System.nanoTime() - start) / 1e9;
 
-            assertEquals(failure == null ? 0 : 1, c.status(), c.stdout() + c.stderr());
+            // A receiver step's 0.3 s is too short for a verdict: inconclusive, 4.
+            assertEquals(failure != null ? 1 : args.get(0).equals("rx") ? 4 : 0, c.status(), c.stdout() + c.stderr());
             Map<String, Object> step = steps(c).get(0);
             String why = failure == null ? null : failure.replace("%s", controller.hci());
             if (why != null && why.contains("{high}")) {  // the window's bound, as the step reports it
@@ -274,6 +291,7 @@ class ConsoleTest {
                 Map.of(0x2033, List.of(ScriptedController.complete(0x2033, 0x11))))) {
             Child c = halvenor("--hci", controller.hci(), "--json", "sweep", "--duration", "0.2");
             assertEquals(List.of(true, false, true, false, true, false), steps(c).stream().map(s -> s.get("ok")).toList());
+            assertEquals(1, c.status(), "steps that could not run outweigh the inconclusive verdicts of the others");
         }
     }
 
@@ -295,51 +313,129 @@ class ConsoleTest {
         assertEquals(1, c.status(), c.stdout() + c.stderr());
         assertTrue(c.stdout().contains(": " + why), c.stdout());
         String html = Files.readString(page);
-        assertTrue(html.contains("id=\"verdict\">1 of 1 steps FAILED") && html.contains(HtmlReport.esc(why)), html);
+        assertTrue(html.contains("id=\"verdict\">1 of 1 step failed") && html.contains(HtmlReport.esc(why)), html);
         String step = command.equals("sweep") ? "rx " : command + " ";
         assertEquals(1, c.stdout().lines().filter(l -> l.startsWith(step)).count(), "stops at the first: " + c.stdout());
         assertNoLibraryLog(c);
     }
 
     static Stream<Arguments> badArguments() {
+        List<String> rx = List.of("rx", "--freq", "2402", "--phy", "1M");
         return Stream.of(
-            Arguments.of(List.of("rx", "--freq", "2441", "--phy", "1M"), "2402 (ch 0), 2440 (ch 19), 2480 (ch 39)"),
-            Arguments.of(List.of("tx", "--freq", "2402", "--phy", "3M"), "valid values are 1M, 2M"),
-            Arguments.of(List.of("rx", "--phy", "1M"), "rx needs --freq (2402, 2440 or 2480)"),
-            Arguments.of(List.of("--hci", "bluetooth0", "demo"), "sim, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]"),
+            Arguments.of(List.of("rx", "--freq", "2441", "--phy", "1M"), "bad --freq '2441': expected 2402 (ch 0), 2440 (ch 19) or 2480 (ch 39)"),
+            Arguments.of(List.of("tx", "--freq", "2402", "--phy", "3M"), "bad --phy '3M': expected 1M or 2M"),
+            Arguments.of(List.of("rx", "--phy", "1M"), "rx needs --freq (2402 (ch 0), 2440 (ch 19) or 2480 (ch 39))"),
+            Arguments.of(List.of("--hci", "bluetooth0", "demo"), "expected sim, none, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]"),
             Arguments.of(List.of("--hci", "tty:/dev/ttyS0,12345", "demo"), "baud rate 12345 is not a standard speed"),
-            Arguments.of(List.of("cw", "--channel", "256", "--power", "1", "--type", "1"), "valid values are 0 to 255"),
-            Arguments.of(List.of("rx", "--freq", "2402", "--phy", "1M", "--window", "0.5"), "at least 1 and at most 40"),
-            Arguments.of(List.of("rx", "--freq", "2402", "--phy", "1M", "--expected", "many"), "1 or more"),
+            Arguments.of(List.of("cw", "--channel", "256", "--power", "1", "--type", "1"), "expected 0 to 255 (or 0x00 to 0xff)"),
+            Arguments.of(concat(rx, List.of("--window", "0.5")), "bad --window '0.5': expected seconds from 1 to 40"),
+            Arguments.of(concat(rx, List.of("--duration", "0.001")), "bad --duration '0.001': expected seconds from 0.01 to 86400"),
+            Arguments.of(concat(rx, List.of("--expected", "many")), "expected a whole number of packets, 1 or more"),
+            Arguments.of(concat(List.of("--limit", "101"), rx), "bad --limit '101': expected a percentage from 0 to 100"),
             Arguments.of(List.of("tx", "--freq", "2402", "--phy", "1M", "--expected", "5"), "does not apply to tx"),
+            Arguments.of(List.of("sweep", "tx", "--window", "5"), "option --window does not apply to sweep tx"),
             Arguments.of(List.of("--jsn", "demo"), "unknown option '--jsn'"),
             Arguments.of(List.of("rx", "--freq", "2402", "--freq", "2440", "--phy", "1M"), "option --freq given twice"),
-            Arguments.of(List.of("--btsnoop", "/nonexistent/dir/x.btsnoop", "demo"), "cannot write there"),
+            // A value never starts with '-' unless written --opt=VALUE.
+            Arguments.of(List.of("--btsnoop", "--json", "rx"), "option --btsnoop needs a value (FILE)"),
+            Arguments.of(List.of("--report", "--json", "demo"), "option --report needs a value (FILE.html)"),
+            Arguments.of(List.of("rx", "--freq", "--phy", "1M"), "option --freq needs a value (F)"),
+            // Files are tried before anything runs, with the system's reason.
+            Arguments.of(List.of("--btsnoop", "/proc/x", "dut", "off"), "bad --btsnoop '/proc/x': No such file or directory"),
+            Arguments.of(List.of("--report", "/proc/x", "dut", "off"), "bad --report '/proc/x': No such file or directory"),
+            Arguments.of(List.of("--csv", "/etc/passwd/x.csv", "dut", "off"), "bad --csv '/etc/passwd/x.csv': Not a directory"),
             Arguments.of(List.of("--btsnoop", "/etc/passwd", "demo"), "the file exists and is not a btsnoop capture"),
-            Arguments.of(List.of("frobnicate"), "use demo, dut on, dut off, tx, rx, cw, sweep or help"),
+            Arguments.of(List.of("USER=nobody", "--csv", "/root/x.csv", "dut", "off"), "bad --csv '/root/x.csv': Permission denied"),
+            Arguments.of(List.of("frobnicate"), "use demo, dut on, dut off, tx, rx, sweep, cw, sim or help"),
+            Arguments.of(List.of("help", "frobnicate"), "unknown command 'frobnicate'"),
             Arguments.of(List.of("HALVENOR_HCI=tcp:localhost", "demo"), "bad HALVENOR_HCI 'tcp:localhost'"));
     }
 
-    /** A leading NAME=VALUE sets the environment instead. */
+    /** A leading NAME=VALUE sets the environment instead; USER=nobody runs the console as nobody. */
     @ParameterizedTest(name = "{0}")
     @MethodSource("badArguments")
     void badArgumentIsNamedWithValidValues(List<String> args, String message) throws Exception {
         boolean env = args.get(0).contains("=") && !args.get(0).startsWith("-");
-        Child c = Child.run(command(env ? args.subList(1, args.size()) : args),
-                            env ? environment(args.get(0).split("=", 2)) : environment(), 60);
+        List<String> run = command(env ? args.subList(1, args.size()) : args);
+        Child c = args.get(0).equals("USER=nobody") ? Child.run(asNobody(run), environment(), 60)
+                  : Child.run(run, env ? environment(args.get(0).split("=", 2)) : environment(), 60);
 
         assertEquals(2, c.status(), c.stderr());
         assertTrue(c.stderr().contains(message), c.stderr());
         assertEquals("", c.stdout());
     }
 
+    private static List<String> asNobody(List<String> command) {
+        return concat(List.of("setpriv", "--reuid=65534", "--regid=65534", "--clear-groups", "env", "HOME=/tmp"), command);
+    }
+
+    /** Each help exits 0 with its page; --help lists every global option. */
     @ParameterizedTest(name = "{0}")
-    @CsvSource(delimiter = '|', value = {"-h|sim [--unix PATH", "help rx|usage: ./halvenor rx --freq F",
-                                         "cw --help|usage: ./halvenor cw --channel C"})
+    @CsvSource(delimiter = '|', value = {"-h|sim [--unix PATH]", "--help|--report FILE.html", "help rx|usage: ./halvenor rx --freq F",
+                                         "cw --help|usage: ./halvenor cw --channel C", "help dut|usage: ./halvenor dut off",
+                                         "dut --help|usage: ./halvenor dut on [--hold S]", "help sim|usage: ./halvenor sim [--unix PATH]",
+                                         "sim --help|usage: halvenor-sim", "help sweep|usage: ./halvenor sweep tx [--duration S]",
+                                         "--version|libhalvenor.so built from commit "})
     void helpHasAPagePerCommand(String args, String shows) throws Exception {
         Child c = halvenor(args.split(" "));
-        assertEquals(0, c.status());
+        assertEquals(0, c.status(), c.stderr());
         assertTrue(c.stdout().contains(shows), c.stdout());
+    }
+
+    /**
+     * The launcher exports the options the table gives an environment variable, and no
+     * others; the standalone simulator takes the table's sim options, with its help lines,
+     * and names each bad value as the console does.
+     */
+    @Test
+    void launcherAndSimulatorTakeTheTablesOptions() throws Exception {
+        String launcher = Files.readString(Path.of(System.getProperty("halvenor.launcher")));
+        java.util.regex.Matcher m = java.util.regex.Pattern.compile("\"([a-z-]+) (HALVENOR_\\w+) (value|flag)\"").matcher(launcher);
+        List<String> exported = new ArrayList<>();
+        while (m.find()) {
+            exported.add(m.group(1) + " " + m.group(2) + " " + m.group(3));
+        }
+        assertEquals(Option.ALL.stream().filter(o -> o.env() != null)
+                     .map(o -> o.name() + " " + o.env() + (o.flag() ? " flag" : " value")).toList(), exported);
+        List<Option> sim = Option.ALL.stream().filter(o -> o.commands().contains("sim")).toList();
+        String help = halvenor("sim", "--help").stdout();
+        assertEquals(sim.size(), help.lines().filter(l -> l.startsWith("  --")).count(), help);
+        for (Option o : sim) {
+            assertTrue(help.contains(String.format("  %-18s %s%n", o.usage(), o.help())), o.usage() + " in " + help);
+            if (o.kind() != Option.Kind.PATH) {
+                Child bad = halvenor("sim", "--" + o.name(), "x-1");
+                assertEquals(2, bad.status(), bad.stderr());
+                assertTrue(bad.stderr().contains(o.bad("x-1").getMessage()), bad.stderr());
+            }
+        }
+    }
+
+    static Stream<Arguments> verdicts() {
+        return Stream.of(  // loss, reference transmitter, options, verdict, exit status
+            Arguments.of("0", "1", List.of(), "PASS", 0),
+            Arguments.of("0.6", "1", List.of(), "FAIL", 3),
+            Arguments.of("0.308", "1", List.of("--duration", "3"), "INCONCLUSIVE", 4),  // the interval straddles the limit
+            Arguments.of("0", "1", List.of("--duration", "0.5"), "INCONCLUSIVE", 4),  // 800 packets, fewer than 1500
+            Arguments.of("0", "1", List.of("--duration", "0.5", "--min-packets", "500"), "PASS", 0),
+            Arguments.of("0.4", "1", List.of("--limit", "50"), "PASS", 0),
+            Arguments.of("0", "0", List.of(), "FAIL", 3));  // no transmitter heard
+    }
+
+    /** The simulator loses packets at random, from a fixed seed; the CSV has the window and the step. */
+    @ParameterizedTest(name = "loss {0}, reference transmitter {1}, {2}: {3}")
+    @MethodSource("verdicts")
+    void verdictComparesTheIntervalWithTheLimit(String loss, String reftx, List<String> options, String verdict, int status)
+            throws Exception {
+        Path csv = fresh("verdict.csv");
+        Child c = Child.run(command(concat(List.of("--json", "--csv", csv.toString(), "rx", "--freq", "2440", "--phy", "1M"),
+                                           options)),
+                            environment("HALVENOR_SIM_LOSS", loss, "HALVENOR_SIM_REFTX", reftx, "HALVENOR_SIM_SEED", "7"), 60);
+
+        assertEquals(status, c.status(), c.stdout() + c.stderr());
+        assertEquals(verdict, steps(c).get(0).get("verdict"), c.stdout());
+        List<String> rows = Files.readAllLines(csv);
+        assertEquals(List.of(Csv.HEADER, "window", "step"), List.of(rows.get(0), rows.get(1).split(",")[0], rows.get(2).split(",")[0]));
+        assertTrue(rows.get(2).endsWith("," + verdict + ",ok"), rows.get(2));
     }
 
     static Stream<Arguments> signals() {
@@ -367,13 +463,7 @@ class ConsoleTest {
         List<String> run = args.stream().map(a -> a.replace("HELD", tty)).toList();
         Process p = Child.start(command(concat(List.of("--btsnoop", snoop.toString(), "--report", page.toString()), run)),
                                 environment());
-        boolean running = Child.waitUntil(() -> {
-            try {
-                return commands(snoop).contains(started);
-            } catch (IOException e) {
-                return false; // header still being written
-            }
-        }, 30);
+        boolean running = sent(snoop, started);
         long start = System.nanoTime();
         new ProcessBuilder("kill", "-" + signal.split(" ")[0], Long.toString(p.pid())).inheritIO().start().waitFor();
         Child c = Child.finish(p, 30);
@@ -417,6 +507,21 @@ class ConsoleTest {
         assertEquals(0, dom.status() + png.status(), dom.stderr());
         assertFalse(dom.stderr().contains("CONSOLE"), "no console messages: " + dom.stderr());
         assertTrue(Files.size(shot) > 10_000, "screenshot taken");
+        assertTrue(dom.stdout().contains("lies below 30.8 %, FAIL above it; at least 1500 packets") && dom.stdout().contains("loss 0.05,"),
+                   "the page records the limit and the simulator's settings");
+        // The step table fits the page: a copy of it measures itself in the browser.
+        Path measured = work.resolve("demo-measured.html");
+        Files.writeString(measured, Files.readString(page).replace("</body>", "<script>var t = document.getElementById("
+                + "'steps').parentElement; document.body.setAttribute('data-fit', [document.documentElement.scrollWidth,"
+                + " innerWidth, t.scrollWidth, t.clientWidth].join(' '));</script></body>"));
+        for (String width : List.of("1000", "1920")) {
+            List<String> at = browser.stream().map(a -> a.replace("1000,2000", width + ",2000")
+                    .replace(page.toUri().toString(), measured.toUri().toString())).toList();
+            String fit = Child.run(concat(at, List.of("--dump-dom")), null, 120).stdout().replaceAll("(?s).*data-fit=\"([0-9 ]+)\".*", "$1");
+            String[] w = fit.split(" ");
+            assertTrue(Integer.parseInt(w[0]) <= Integer.parseInt(w[1]) && Integer.parseInt(w[2]) <= Integer.parseInt(w[3]),
+                       "no horizontal scrolling at " + width + " px: " + fit);
+        }
         List<Map<String, Object>> steps = steps(c);
         java.util.regex.Matcher point = java.util.regex.Pattern.compile(
                 "<g class=\"point\" data-step=\"(\\d+)\"[^>]* data-per=\"([^\"]+)\" data-low=\"([^\"]+)\""
@@ -432,9 +537,9 @@ class ConsoleTest {
         for (int i = 2; i < 8; i++) {
             Map<String, Object> s = steps.get(i);
             long expected = number(s, "expected");
-            assertTrue(expected >= 780 && Math.abs(number(s, "received") - 0.95 * expected) <= expected / 20, s.toString());
+            assertTrue(expected >= 1580 && Math.abs(number(s, "received") - 0.95 * expected) <= expected / 20, s.toString());
             assertTrue(s.get("commands").toString().contains("status_name=Success"), s.toString());
-            String row = "<tr data-step=\"" + i + "\"><td>rx</td><td>" + s.get("setting") + "</td><td>0.50 s</td><td>"
+            String row = "<tr data-step=\"" + i + "\"><td>rx</td><td>" + s.get("setting") + "</td><td>1.00 s</td><td>"
                          + number(s, "received") + "</td><td>" + expected + "</td>";
             assertTrue(dom.stdout().contains(row), row);
         }
@@ -442,7 +547,7 @@ class ConsoleTest {
 
     @Test
     void progressIsDrawnOnTerminal() throws Exception {
-        String run = String.join(" ", command(List.of("rx", "--freq", "2440", "--phy", "2M", "--duration", "0.5")));
+        String run = String.join(" ", command(List.of("rx", "--freq", "2440", "--phy", "2M", "--duration", "0.5", "--min-packets", "100")));
         Child c = Child.run(List.of("script", "-qec", run, "/dev/null"), environment(), 60);
 
         assertEquals(0, c.status(), c.stdout() + c.stderr());
@@ -457,9 +562,10 @@ class ConsoleTest {
         try {
             assertTrue(Child.waitUntil(() -> Files.exists(socket), 30), "the simulator listens");
             String hci = "unix:" + socket;
-            Process tx = Child.start(command(List.of("--hci", hci, "tx", "--freq", "2440", "--phy", "2M",
-                                                     "--duration", "3")), environment());
-            Thread.sleep(1000);
+            Path snoop = fresh("tx.btsnoop");
+            Process tx = Child.start(command(List.of("--btsnoop", snoop.toString(), "--hci", hci, "tx", "--freq", "2440",
+                                                     "--phy", "2M", "--duration", "6")), environment());
+            assertTrue(sent(snoop, "01 34 20 04 13 25 00 02"), "the transmitter started");
             Child rx = halvenor("--hci", hci, "--json", "rx", "--freq", "2440", "--phy", "2M", "--duration", "1");
             assertEquals(0, Child.finish(tx, 30).status());
             assertEquals(0, rx.status(), rx.stdout() + rx.stderr());
