@@ -1,12 +1,17 @@
 #!/usr/bin/env bash
-# Installs the Debian packages the build, the console and the tests need.
-# Runs apt-get update only when something is missing.
+# Installs the Debian packages the console needs (runtime), or those and the
+# ones the tests add (test, the default). Runs apt-get update only when
+# something is missing.
 set -euo pipefail
 
-packages=(
-  build-essential cmake ninja-build pkg-config
+# runtime: what the console needs to build and run; test: what the test command adds.
+runtime=(
+  build-essential cmake ninja-build pkg-config git
   android-liblog-dev android-libutils-dev
-  openjdk-17-jdk-headless junit5 libgoogle-gson-java
+  openjdk-17-jdk-headless
+)
+test=(
+  junit5 libgoogle-gson-java
   libgtest-dev libgmock-dev libbenchmark-dev
   clang libclang-rt-dev
   bluez-test-tools tshark
@@ -14,6 +19,11 @@ packages=(
   soong mini-soong
   cloc
 )
+case ${1:-test} in
+  runtime) packages=("${runtime[@]}") ;;
+  test) packages=("${runtime[@]}" "${test[@]}") ;;
+  *) echo "usage: install-deps.sh [runtime|test]" >&2; exit 2 ;;
+esac
 
 missing=()
 for p in "${packages[@]}"; do

@@ -6,7 +6,7 @@
 # qemu (scripts/test-aarch64.sh). Fails on any failing test or sanitizer report.
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
-bash "$root/scripts/install-deps.sh"
+bash "$root/scripts/install-deps.sh" test
 
 export JAVA_HOME=/usr/lib/jvm/java-17-openjdk-$(dpkg --print-architecture)
 jobs=$(nproc)
@@ -20,7 +20,7 @@ build() {  # build <dir> <cmake args...>
 step() { echo; echo "=== $* ==="; }
 
 step "build and test (gcc, -Wall -Wextra -Werror)"
-build main
+build main -DHALVENOR_TESTS=ON
 ctest --test-dir "$root/build/main" --output-on-failure -j "$jobs"
 
 step "Android.bp: bpfix, and libhalvenor.so built from it by mini-soong"
