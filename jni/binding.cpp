@@ -130,15 +130,6 @@ void initNative(JNIEnv* env, jobject obj) {
     if (sTestModeObject == nullptr) LOGE("initNative, object is null return!!!");
 }
 
-// Ends the session in the order that keeps every thread off released state:
-// the tool end closed, the pump joined and the bridge end closed, and only
-// then the HAL service closed and released.
-static void end_session() {
-    hidl_client_close_tool_end();
-    hidl_client_stop_bridge();
-    hidl_client_release_service("destoryNative");
-}
-
 void destoryNative(JNIEnv* env, jobject) {
     LOGI("destoryNative()");
     bt_fd = -1;
@@ -150,5 +141,5 @@ void destoryNative(JNIEnv* env, jobject) {
         LOGE("destoryNative, error happened!!!");
     }
     LOGI("BLE close HIDL!");
-    end_session();
+    session_end("destoryNative");
 }

@@ -50,7 +50,31 @@ cc_library_shared {
     cpp_std: "c++17",
 }
 
-// IBluetoothHci::getService and the host HAL service behind it.
+// The NDK binder of an API 31 device: calls, service manager, status.
+cc_library_shared {
+    name: "libbinder_ndk",
+    srcs: [
+        "../vendor/host/binder/status.cpp",
+        "../vendor/host/binder/ibinder.cpp",
+        "../vendor/host/binder/interface_utils.cpp",
+        "../vendor/host/binder/service_manager.cpp",
+        "../vendor/host/binder/service_manager_api31.cpp",
+    ],
+    export_include_dirs: ["../vendor/host/binder/include"],
+    cpp_std: "c++17",
+}
+
+// The classes the NDK backend generates for android.hardware.bluetooth V1.
+cc_library_static {
+    name: "android.hardware.bluetooth-V1-ndk",
+    srcs: ["../vendor/host/binder/bluetooth_hci*.cpp"],
+    export_include_dirs: ["../vendor/host/binder/include"],
+    cflags: ["-fPIC"],
+    shared_libs: ["libbinder_ndk"],
+    cpp_std: "c++17",
+}
+
+// IBluetoothHci::getService and the host HAL services behind it, HIDL and AIDL.
 cc_library_shared {
     name: "android.hardware.bluetooth@1.0",
     srcs: [
@@ -63,7 +87,9 @@ cc_library_shared {
         "liblog",
         "libutils",
         "libhidlbase",
+        "libbinder_ndk",
     ],
+    static_libs: ["android.hardware.bluetooth-V1-ndk"],
     cpp_std: "c++17",
 }
 EOF
@@ -104,6 +130,9 @@ for bp in sorted(Path(".").glob("*/*.bp")):
             if lib != "jni_headers":
                 sys.exit(f"{bp}: header library {lib} has no host stand-in")
             print(f"{name}_CXXFLAGS += -I{jdk}/include -I{jdk}/include/linux")
+        for lib in props.get("static_libs", []):  # mini-soong takes no headers from these
+            print(f"{name}_CXXFLAGS += $({lib}_INCLUDES)")
+            print(f"{name}.so.$({name}_soversion): {lib}.a")
         for lib in props.get("shared_libs", []):
             # mini-soong links every library as -l<name without its first
             # three letters>, which only works for names starting with lib.

@@ -14,8 +14,6 @@
 #include "transport/log.h"
 #include "transport/session.h"
 
-using android::hardware::hidl_vec;
-using android::hardware::Return;
 
 struct timeval timeout;
 
@@ -56,10 +54,16 @@ static ssize_t peek_waiting(int fd, std::vector<uint8_t>& batch) {
     return n;
 }
 
+// The types the pump reads: commands, ACL, SCO and events, and ISO data where
+// the session's HAL takes it.
+static bool pump_reads(uint8_t type) {
+    return (type >= H4_TYPE_COMMAND && type <= H4_TYPE_EVENT) || session_takes(type);
+}
+
 // Length on the wire, type byte included, of the packet at p, or 0 when its
 // type byte is not one the pump reads or the avail bytes end inside it.
 static size_t whole_packet_len(const uint8_t* p, size_t avail) {
-    if (avail < 1 || p[0] == 0 || p[0] > H4_TYPE_EVENT) return 0;
+    if (avail < 1 || !pump_reads(p[0])) return 0;
     size_t len = h4_packet_len(p, avail);
     return len <= avail ? len : 0;
 }
@@ -99,18 +103,19 @@ static bool read_type_byte(int fd, uint8_t* type) {
 // without the type byte. False ends the pump.
 static bool read_packet(int fd, uint8_t* type, std::vector<uint8_t>& packet) {
     LOGI("%s: Packet type :%d", "process_tool_data", *type);
-    if (*type == 0 || *type > H4_TYPE_EVENT) {
+    if (!pump_reads(*type)) {
         LOGE("%s: Unsupported preamble_len packet type %d", "process_tool_data", *type);
         return false;
     }
 
     uint8_t preamble[H4_MAX_HEADER] = {0};
-    int preamble_len = preamble_len_table[*type - 1];
+    int preamble_len = static_cast<int>(h4_header_len(*type));
     if (safe_read(fd, preamble, preamble_len) == -1) {
         LOGE("%s: failed to read the packet from tools", "process_tool_data");
         return false;
     }
-    int payload_len = get_payload_len(*type, preamble);
+    int payload_len = *type == H4_TYPE_ISO ? static_cast<int>(h4_payload_len(*type, preamble))
+                                           : get_payload_len(*type, preamble);
     if (payload_len < 0) {
         LOGE("%s: Invalid payload length ", "process_tool_data");
         return false;
@@ -132,21 +137,7 @@ static bool forward_packet(uint8_t type, uint8_t* packet, size_t len) {
         LOGE("%s: Unsupported packet type: %d", "process_tool_data", type);
         return true;
     }
-    // Every session change joins the pump before it touches btHci, so the
-    // service read here is the one this session opened.
-    if (btHci == nullptr) {
-        LOGE("%s: no HAL service, packet dropped", "process_tool_data");
-        return true;
-    }
-    hidl_vec<uint8_t> hci;
-    hci.setToExternal(packet, len);
-    Return<void> sent = type == H4_TYPE_COMMAND ? btHci->sendHciCommand(hci)
-                        : type == H4_TYPE_ACL   ? btHci->sendAclData(hci)
-                                                : btHci->sendScoData(hci);
-    if (sent.isOk()) return true;
-    LOGE("%s: the HAL refused packet type %d: %s", "process_tool_data", type,
-         sent.description().c_str());
-    return !sent.isDeadObject();
+    return session_send(type, packet, len) != HAL_DEAD;
 }
 
 // The packets taken at once are logged as one by one: the lines safe_read and

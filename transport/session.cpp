@@ -1,11 +1,12 @@
-// HAL client session: finds and initialises the HAL, builds the socket-pair
-// bridge and starts the pump. Opening and closing run on the Java thread; the
-// callbacks run on HAL threads.
+// HAL client session: opens a session with the Bluetooth HAL (the AIDL HAL
+// where the platform declares it, the HIDL HAL otherwise), builds the
+// socket-pair bridge to the engine and starts the pump; every path ends it
+// through one teardown. Opening and closing run on the calling Java thread,
+// the HAL's callbacks on HAL threads.
 #include "transport/session.h"
 
 #include <errno.h>
 #include <pthread.h>
-#include <semaphore.h>
 #include <string.h>
 #include <sys/socket.h>
 #include <time.h>
@@ -15,23 +16,12 @@
 #include <vector>
 
 #include "transport/h4.h"
+#include "transport/hal.h"
 #include "transport/log.h"
 #include "transport/pump.h"
 
-using android::sp;
-using android::wp;
-using android::hardware::hidl_death_recipient;
-using android::hardware::hidl_vec;
-using android::hardware::Return;
-using android::hardware::Void;
-using android::hidl::base::V1_0::IBase;
-using android::hardware::bluetooth::V1_0::IBluetoothHci;
-using android::hardware::bluetooth::V1_0::IBluetoothHciCallbacks;
-using android::hardware::bluetooth::V1_0::Status;
-
 int server_fd = -1;
 int client_fd = -1;
-sp<IBluetoothHci> btHci;
 int bt_fd = -1;
 uint8_t cmd_test_end_flag = 0;
 
@@ -39,109 +29,101 @@ uint8_t cmd_test_end_flag = 0;
 static const int kInitTimeoutMs = 10000;
 
 static bool hidl_ready = false;
-static sem_t init_sem;
 static pthread_t tool_thread;
-static bool tool_thread_started = false;
 
-// Guards hidl_ready, which callback object may still end the current
-// initialisation wait (so a late answer to an abandoned opening is ignored),
-// and which service's death notice concerns the current session.
-static std::mutex init_lock;
-static const IBluetoothHciCallbacks* init_waiter = nullptr;
-static uint64_t session_cookie = 0;
+// The rest of the session, reset as one by the teardown and the opening.
+static struct {
+    const HalAdapter* hal;    // the HAL of the open session, or null
+    bool pump_started;        // tool_thread is to be joined
+    const void* init_waiter;  // the callback object whose answer ends the opening's wait
+    bool init_answered;
+    uint64_t cookie;          // names the session's service in its death notices
+} session;
 
+// init_lock guards hidl_ready, the opening's wait and the cookie; init_done,
+// signalled on the monotonic clock, which no change of the system time moves.
+static pthread_mutex_t init_lock = PTHREAD_MUTEX_INITIALIZER;
+static pthread_cond_t init_done;
+static pthread_once_t init_done_made = PTHREAD_ONCE_INIT;
 // Held while a callback writes to server_fd and while server_fd is replaced
 // or closed, so no callback writes into a closed or reused descriptor.
 static std::mutex bridge_lock;
 
-namespace {
+static void make_init_done() {
+    pthread_condattr_t attr;
+    pthread_condattr_init(&attr);
+    pthread_condattr_setclock(&attr, CLOCK_MONOTONIC);
+    pthread_cond_init(&init_done, &attr);
+    pthread_condattr_destroy(&attr);
+}
 
-// Told when the HAL's process dies: the session cannot carry anything more,
-// so an opening waiting for the HAL gives up at once and the engine finds the
-// bridge ended instead of waiting out its time-outs.
-class HalDeathRecipient : public hidl_death_recipient {
-  public:
-    void serviceDied(uint64_t cookie, const wp<IBase>& who) override;
-};
+void session_expect_initialized(const void* waiter) {
+    pthread_mutex_lock(&init_lock);
+    hidl_ready = false;
+    session.init_waiter = waiter;
+    session.init_answered = false;
+    pthread_mutex_unlock(&init_lock);
+}
 
-class BluetoothHciCallbacks : public IBluetoothHciCallbacks {
-  public:
-    ~BluetoothHciCallbacks() override = default;
-    Return<void> initializationComplete(Status status) override;
-    Return<void> hciEventReceived(const hidl_vec<uint8_t>& event) override;
-    Return<void> aclDataReceived(const hidl_vec<uint8_t>& data) override;
-    Return<void> scoDataReceived(const hidl_vec<uint8_t>& data) override;
-};
+// Only the answer to the opening in progress counts: a late answer to an
+// abandoned one must not complete a later opening.
+void session_initialized(const void* waiter, bool ok) {
+    pthread_mutex_lock(&init_lock);
+    bool current = waiter != nullptr && waiter == session.init_waiter;
+    if (current) {
+        hidl_ready = ok;
+        session.init_answered = true;
+        session.init_waiter = nullptr;
+        pthread_cond_broadcast(&init_done);
+    }
+    pthread_mutex_unlock(&init_lock);
+    if (!current) LOGE("%s: answer to an abandoned opening ignored", "initializationComplete");
+}
 
-// Ends the opening's wait for the HAL; init_lock is held.
-void end_init_wait_locked(bool ready) {
-    hidl_ready = ready;
-    init_waiter = nullptr;
-    sem_post(&init_sem);
+// The session cannot carry anything more: an opening waiting for the HAL
+// gives up at once, and the engine finds the bridge ended instead of waiting
+// out its time-outs.
+void session_hal_died(uint64_t cookie) {
+    pthread_mutex_lock(&init_lock);
+    bool current = cookie == session.cookie;
+    if (current) {
+        LOGE("%s: the Bluetooth HAL died", "serviceDied");
+        if (session.init_waiter != nullptr) {
+            session.init_waiter = nullptr;
+            session.init_answered = true;
+            hidl_ready = false;
+            pthread_cond_broadcast(&init_done);
+        }
+    }
+    pthread_mutex_unlock(&init_lock);
+    if (!current) return;  // an earlier session's service
+    std::lock_guard<std::mutex> guard(bridge_lock);
+    if (server_fd != -1) shutdown(server_fd, SHUT_RDWR);
 }
 
 // Type byte and packet go out in one locked write: packets from callbacks on
 // several HAL threads never interleave in the stream. A packet whose size
 // disagrees with its own header would shift every packet after it, so it is
 // dropped.
-void write_to_tool(uint8_t type, const hidl_vec<uint8_t>& packet, const char* callback) {
-    if (!h4_packet_agrees(type, packet.data(), packet.size())) {
-        LOGE("%s: packet of %zu bytes disagrees with its header, dropped", callback, packet.size());
+void session_deliver(uint8_t type, const uint8_t* packet, size_t len, const char* callback) {
+    if (!h4_packet_agrees(type, packet, len)) {
+        LOGE("%s: packet of %zu bytes disagrees with its header, dropped", callback, len);
         return;
     }
-    std::vector<unsigned char> h4(packet.size() + 1);
+    std::vector<unsigned char> h4(len + 1);
     h4[0] = type;
-    if (packet.size() > 0) memcpy(h4.data() + 1, packet.data(), packet.size());
-
+    if (len > 0) memcpy(h4.data() + 1, packet, len);
     std::lock_guard<std::mutex> guard(bridge_lock);
     if (safe_write(server_fd, h4.data(), static_cast<int>(h4.size())) == -1) {
         LOGE("%s: failed to write event to tool socket", callback);
     }
 }
 
-Return<void> BluetoothHciCallbacks::initializationComplete(Status status) {
-    bool ok = status == Status::SUCCESS;
-    if (!ok) LOGE("Error in HIDL initialization");
-
-    std::lock_guard<std::mutex> guard(init_lock);
-    if (init_waiter != this) {
-        LOGE("%s: answer to an abandoned opening ignored", "initializationComplete");
-        return Void();
-    }
-    end_init_wait_locked(ok);
-    return Void();
+HalSend session_send(uint8_t type, const uint8_t* packet, size_t len) {
+    return session.hal != nullptr ? session.hal->send(type, packet, len) : HAL_SENT;
 }
 
-Return<void> BluetoothHciCallbacks::hciEventReceived(const hidl_vec<uint8_t>& event) {
-    write_to_tool(H4_TYPE_EVENT, event, "hciEventReceived");
-    return Void();
-}
-
-Return<void> BluetoothHciCallbacks::aclDataReceived(const hidl_vec<uint8_t>& data) {
-    write_to_tool(H4_TYPE_ACL, data, "aclDataReceived");
-    return Void();
-}
-
-Return<void> BluetoothHciCallbacks::scoDataReceived(const hidl_vec<uint8_t>& data) {
-    write_to_tool(H4_TYPE_SCO, data, "scoDataReceived");
-    return Void();
-}
-
-void HalDeathRecipient::serviceDied(uint64_t cookie, const wp<IBase>&) {
-    {
-        std::lock_guard<std::mutex> guard(init_lock);
-        if (cookie != session_cookie) return;  // an earlier session's service
-        LOGE("%s: the Bluetooth HAL died", "serviceDied");
-        if (init_waiter != nullptr) end_init_wait_locked(false);
-    }
-    std::lock_guard<std::mutex> guard(bridge_lock);
-    if (server_fd != -1) shutdown(server_fd, SHUT_RDWR);
-}
-
-}  // namespace
-
-// Linked to the service of each session; the cookie names the session.
-static sp<hidl_death_recipient> hal_death;
+bool session_takes(uint8_t type) { return session.hal != nullptr && session.hal->takes(type); }
 
 void hidl_client_close_tool_end() {
     if (client_fd != -1) close(client_fd);
@@ -150,121 +132,68 @@ void hidl_client_close_tool_end() {
     bt_fd = -1;
 }
 
-void hidl_client_stop_bridge() {
-    // shutdown wakes a pump blocked in its wait or read, and a callback
-    // blocked in a write, without freeing the descriptor number; only once the
-    // pump is joined is the number given back.
+// shutdown wakes a pump blocked in its wait or read, and a callback blocked in
+// a write, without freeing the descriptor number; only once the pump is joined
+// is the number given back.
+static void stop_bridge() {
     if (server_fd != -1) shutdown(server_fd, SHUT_RDWR);
-    if (tool_thread_started) {
+    if (session.pump_started) {
         pthread_join(tool_thread, nullptr);
-        tool_thread_started = false;
+        session.pump_started = false;
     }
     std::lock_guard<std::mutex> guard(bridge_lock);
     if (server_fd != -1) close(server_fd);
     server_fd = -1;
 }
 
-// A dead service's unlink fails; there is nothing left to unlink then.
-static void unlink_death_notice() {
-    if (hal_death == nullptr) return;
-    Return<bool> unlinked = btHci->unlinkToDeath(hal_death);
-    unlinked.isOk();
+// The one teardown, in the order that keeps every thread off released state:
+// the tool end (when asked), the pump and the bridge end, then the HAL, closed
+// and released. `line`, when given, is logged with `caller` before the HAL is
+// closed.
+static void end_session(const char* caller, bool close_tool_end, const char* line) {
+    if (close_tool_end) hidl_client_close_tool_end();
+    stop_bridge();
+    if (line != nullptr) LOGI(line, caller);
+    if (session.hal != nullptr) session.hal->release(true, caller);
+    session.hal = nullptr;
 }
 
-void hidl_client_release_service(const char* caller) {
-    if (btHci == nullptr) return;
-    unlink_death_notice();
-    if (!btHci->close().isOk()) LOGI("%s: HIDL daemon is dead", caller);
-    btHci.clear();
+void session_end(const char* caller) { end_session(caller, true, nullptr); }
+
+// Waits, bounded, for the answer to initialize; true when the HAL said it is ready.
+static bool wait_for_init() {
+    struct timespec deadline;
+    clock_gettime(CLOCK_MONOTONIC, &deadline);
+    deadline.tv_sec += kInitTimeoutMs / 1000;
+    pthread_mutex_lock(&init_lock);
+    while (!session.init_answered && pthread_cond_timedwait(&init_done, &init_lock, &deadline) != ETIMEDOUT) {
+    }
+    bool answered = session.init_answered, ready = hidl_ready;
+    session.init_waiter = nullptr;  // a late answer is ignored
+    pthread_mutex_unlock(&init_lock);
+    if (!answered) LOGE("%s: no answer from the HAL within %d ms", "hidl_client_initialize", kInitTimeoutMs);
+    return answered && ready;
 }
 
 // A failed opening gives back the service it obtained, closed when it was
-// initialised, so no HAL stays initialised behind a session that never was.
-// The opening has logged why it failed; a dead HAL's close adds nothing.
-static void abandon_service(bool initialised) {
-    unlink_death_notice();
-    if (initialised) {
-        Return<void> closed = btHci->close();
-        closed.isOk();
+// handed callbacks, unless it answered that someone else holds it: taking the
+// HAL from a running Bluetooth stack by closing it is never the library's to do.
+static bool open_hal(const HalAdapter* hal) {
+    pthread_once(&init_done_made, make_init_done);
+    pthread_mutex_lock(&init_lock);
+    uint64_t cookie = ++session.cookie;
+    pthread_mutex_unlock(&init_lock);
+    if (!hal->open(cookie)) return false;
+    session.hal = hal;
+    if (hal->initialize() && wait_for_init()) {
+        LOGE(hal->ready_line, "hidl_client_initialize");
+        return true;
     }
-    btHci.clear();
-}
-
-// An opening replaces whatever an earlier session left, pump and bridge first,
-// so no thread or descriptor outlives its session.
-static void end_previous_session() {
-    hidl_client_close_tool_end();
-    hidl_client_stop_bridge();
-    hidl_client_release_service("hidl_client_initialize");
-}
-
-static bool arm_init_wait(const IBluetoothHciCallbacks* waiter) {
-    std::lock_guard<std::mutex> guard(init_lock);
-    hidl_ready = false;
-    init_waiter = waiter;
-    return sem_init(&init_sem, 0, 0) == 0;
-}
-
-static void disarm_init_wait() {
-    std::lock_guard<std::mutex> guard(init_lock);
-    init_waiter = nullptr;
-}
-
-// The death notice of the new service names a new session. A HAL that will
-// not give one still works; only its death is noticed later, at a send.
-static bool link_death_notice() {
-    uint64_t cookie;
-    {
-        std::lock_guard<std::mutex> guard(init_lock);
-        cookie = ++session_cookie;
-    }
-    if (hal_death == nullptr) hal_death = new HalDeathRecipient();
-    Return<bool> linked = btHci->linkToDeath(hal_death, cookie);
-    if (!linked.isOk()) {
-        LOGE("%s: the HAL died before initialize: %s", "hidl_client_initialize",
-             linked.description().c_str());
-        return false;
-    }
-    if (!linked) LOGI("%s: the HAL gives no death notice", "hidl_client_initialize");
-    return true;
-}
-
-// Waits, bounded, for initializationComplete; true when the HAL answered.
-static bool wait_for_init() {
-    struct timespec deadline;
-    clock_gettime(CLOCK_REALTIME, &deadline);
-    deadline.tv_sec += kInitTimeoutMs / 1000;
-    deadline.tv_nsec += (kInitTimeoutMs % 1000) * 1000000L;
-    if (deadline.tv_nsec >= 1000000000L) {
-        deadline.tv_sec += 1;
-        deadline.tv_nsec -= 1000000000L;
-    }
-    int rc;
-    while ((rc = sem_timedwait(&init_sem, &deadline)) == -1 && errno == EINTR) {
-    }
-    std::lock_guard<std::mutex> guard(init_lock);
-    // A post that raced the time-out still counts; otherwise disown the wait.
-    bool answered = rc == 0 || init_waiter == nullptr;
-    init_waiter = nullptr;
-    if (!answered) {
-        LOGE("%s: no answer from the HAL within %d ms", "hidl_client_initialize", kInitTimeoutMs);
-    }
-    return answered && hidl_ready;
-}
-
-static bool initialize_hal() {
-    sp<IBluetoothHciCallbacks> callbacks = new BluetoothHciCallbacks();
-    if (!arm_init_wait(callbacks.get())) {
-        LOGE("%s: sem_init failed: %s", "hidl_client_initialize", strerror(errno));
-        return false;
-    }
-    Return<void> started = btHci->initialize(callbacks);
-    if (!started.isOk()) {
-        disarm_init_wait();
-        LOGE("%s: initialize failed: %s", "hidl_client_initialize", started.description().c_str());
-        return false;
-    }
-    return wait_for_init();
+    session_expect_initialized(nullptr);
+    LOGE(hal->failed_line, "hidl_client_initialize");
+    hal->release(!hal->in_use(), nullptr);
+    session.hal = nullptr;
+    return false;
 }
 
 static bool open_bridge() {
@@ -278,15 +207,12 @@ static bool open_bridge() {
         server_fd = fds[0];
     }
     client_fd = fds[1];
-
     int err = pthread_create(&tool_thread, nullptr, process_tool_data, nullptr);
     if (err != 0) {
         LOGE("%s:Unable to create pthread err = %s", "hidl_client_initialize", strerror(err));
-        hidl_client_close_tool_end();
-        hidl_client_stop_bridge();
         return false;
     }
-    tool_thread_started = true;
+    session.pump_started = true;
     return true;
 }
 
@@ -297,30 +223,12 @@ bool hidl_client_initialize(int, int* tool_fd) {
         LOGE("%s: Invalid tool FD", "hidl_client_initialize");
         return false;
     }
-    LOGI("%s: Initialize the HIDL with Mode BT", "hidl_client_initialize");
-    end_previous_session();
-
-    btHci = IBluetoothHci::getService("default", false);
-    if (btHci == nullptr) {
-        LOGE("Unable to initialize the HIDL");
-        return false;
-    }
-    LOGI("%s: IBluetoothHci::getService() returned %p (%s)", "hidl_client_initialize",
-         btHci.get(), btHci->isRemote() ? "remote" : "local");
-    if (!link_death_notice()) {
-        abandon_service(false);
-        return false;
-    }
-
-    if (!initialize_hal()) {
-        LOGE("%s: HIDL failed to initialize, sending invalid FD to tool", "hidl_client_initialize");
-        abandon_service(true);
-        return false;
-    }
-    LOGE("%s: HIDL = true", "hidl_client_initialize");
-
+    // An opening replaces whatever an earlier session left, so no thread or
+    // descriptor outlives its session.
+    end_session("hidl_client_initialize", true, nullptr);
+    if (!open_hal(aidl_hal_declared() ? &aidl_hal : &hidl_hal)) return false;
     if (!open_bridge()) {
-        abandon_service(true);
+        end_session("hidl_client_initialize", true, nullptr);
         return false;
     }
     LOGE("Server FD=%d  Client FD: %d\n", server_fd, client_fd);
@@ -329,7 +237,7 @@ bool hidl_client_initialize(int, int* tool_fd) {
 }
 
 void hidl_client_init() {
-    LOGE("%s: use HIDL", "hidl_client_init");
+    if (!aidl_hal_declared()) LOGE("%s: use HIDL", "hidl_client_init");
     if (!hidl_client_initialize(0, &bt_fd)) {
         LOGI("%s: HIDL client initialization failed \n", "hidl_client_init");
         bt_fd = -1;
@@ -341,7 +249,5 @@ void hidl_client_close() {
         LOGI("%s: Hidl init = false", "hidl_client_close");
         return;
     }
-    hidl_client_stop_bridge();
-    LOGI("%s: Close HIDL with Mode BT", "hidl_client_close");
-    hidl_client_release_service("hidl_client_close");
+    end_session("hidl_client_close", false, "%s: Close HIDL with Mode BT");
 }

@@ -23,6 +23,17 @@ AIBinder* lookUpLocked(Registry& r, const std::string& instance) {
     return it->second;
 }
 
+AIBinder* makeService(const std::string& instance) {
+    AIBinder* (*make)() = nullptr;
+    {
+        Registry& r = registry();
+        std::lock_guard<std::mutex> guard(r.lock);
+        auto it = r.makers.find(instance);
+        if (it != r.makers.end()) make = it->second;
+    }
+    return make != nullptr ? make() : nullptr;
+}
+
 void forgetService(AIBinder* binder) {
     std::vector<AIBinder*> dropped;
     {
@@ -67,9 +78,13 @@ binder_exception_t AServiceManager_addService(AIBinder* binder, const char* inst
 
 AIBinder* AServiceManager_checkService(const char* instance) {
     if (instance == nullptr) return nullptr;
-    Registry& r = registry();
-    std::lock_guard<std::mutex> guard(r.lock);
-    return binder_host::lookUpLocked(r, instance);
+    {
+        Registry& r = registry();
+        std::lock_guard<std::mutex> guard(r.lock);
+        AIBinder* found = binder_host::lookUpLocked(r, instance);
+        if (found != nullptr) return found;
+    }
+    return binder_host::makeService(instance);
 }
 
 AIBinder* AServiceManager_getService(const char* instance) { return AServiceManager_checkService(instance); }
@@ -91,6 +106,17 @@ bool removeService(const char* instance) {
     registry().changed.notify_all();
     AIBinder_decStrong(removed);
     return true;
+}
+
+void setServiceMaker(const char* instance, AIBinder* (*make)()) {
+    if (instance == nullptr) return;
+    Registry& r = registry();
+    std::lock_guard<std::mutex> guard(r.lock);
+    if (make != nullptr) {
+        r.makers[instance] = make;
+    } else {
+        r.makers.erase(instance);
+    }
 }
 
 void setDeclared(const char* instance, bool declared) {

@@ -10,6 +10,11 @@ namespace host {
 // Drops the registration under the name, as when a service is stopped. False when there was none.
 bool removeService(const char* instance);
 
+// Serves the name on demand, as a lazy HAL starts when first looked up: a
+// lookup that finds nothing registered gets a new service from make (a strong
+// reference it owns). Null stops it.
+void setServiceMaker(const char* instance, AIBinder* (*make)());
+
 // Declares the name in the host's manifest, or takes it out: what AServiceManager_isDeclared answers.
 void setDeclared(const char* instance, bool declared);
 
