@@ -1,31 +1,25 @@
-// Picks the controller behind IBluetoothHci "default" on a host, from
-// HALVENOR_HCI: the simulated controller (default), H4 over a unix or TCP
-// socket or a serial line, or no service at all. Runs on the thread that calls getService.
+// Picks the controller behind the host's Bluetooth HAL, HIDL or AIDL alike,
+// from HALVENOR_HCI: the simulated controller (default), H4 over a unix or TCP
+// socket or a serial line, or no service at all. Runs on the thread that looks
+// the service up.
 #include <stdlib.h>
 
 #include <string>
 
-#include <hidl/HostServices.h>
-
 #include "host/hal/h4_hci.h"
-#include "host/hal/host_hci.h"
+#include "host/hal/host_controller.h"
 #include "host/hal/host_log.h"
 #include "host/hal/sim_hci.h"
 #include "host/hal/sim_settings.h"
 
 namespace {
 
-// What getService hands out for a setting it cannot use: the library sees a
-// service whose initialisation fails, and logs that itself.
-class UnusableHci final : public HostHci {
+// What a setting that cannot be used gives: the library sees a service whose
+// initialisation fails, and logs that itself.
+class UnusableController final : public HostController {
   public:
-    Return<void> initialize(const sp<IBluetoothHciCallbacks>& callback) override {
-        callback->initializationComplete(Status::INITIALIZATION_ERROR);
-        return Void();
-    }
-
-  private:
-    Return<void> send(uint8_t, const hidl_vec<uint8_t>&) override { return Void(); }
+    void start(std::shared_ptr<ControllerClient> client) override { client->initialized(false); }
+    bool send(uint8_t, const uint8_t*, size_t) override { return true; }
     void stop() override {}
 };
 
@@ -64,28 +58,19 @@ bool sim_settings(SimControllerSettings* settings) {
 
 }  // namespace
 
-namespace android {
-namespace hardware {
-namespace host {
-
-sp<bluetooth::V1_0::IBluetoothHci> createDefaultBluetoothHci(const std::string& serviceName) {
-    if (serviceName != "default") return nullptr;
+std::unique_ptr<HostController> controller_from_environment() {
     std::string value = env_or("HALVENOR_HCI", "sim");
     if (value == "none") return nullptr;  // a device without a Bluetooth HAL
     if (value == "sim") {
         SimControllerSettings settings;
-        if (!sim_settings(&settings)) return new UnusableHci();
+        if (!sim_settings(&settings)) return std::make_unique<UnusableController>();
         return create_sim_hci(settings);
     }
     H4Target target;
     std::string why;
     if (!parse_h4_target(value, &target, &why)) {
         HLOGE("HALVENOR_HCI=\"%s\": %s", value.c_str(), why.c_str());
-        return new UnusableHci();
+        return std::make_unique<UnusableController>();
     }
     return create_h4_hci(target);
 }
-
-}  // namespace host
-}  // namespace hardware
-}  // namespace android

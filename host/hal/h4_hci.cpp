@@ -1,6 +1,7 @@
-// IBluetoothHci over H4 on a stream. The reader thread connects (bounded),
-// answers initializationComplete once, then reassembles the controller's
-// stream into callbacks until close, end of stream or a bad type byte.
+// A controller speaking H4 on a stream. The reader thread connects (bounded),
+// tells the client once whether it could, then reassembles the controller's
+// stream into packets for the client until stop, end of stream or a byte
+// that starts no packet.
 #include "host/hal/h4_hci.h"
 
 #include <errno.h>
@@ -19,7 +20,6 @@
 #include "host/hal/btsnoop.h"
 #include "host/hal/h4_io.h"
 #include "host/hal/h4_stream.h"
-#include "host/hal/host_hci.h"
 #include "host/hal/host_log.h"
 
 // A controller that takes no byte of a packet for this long is stuck: the
@@ -28,12 +28,14 @@ static const int kWriteTimeoutMs = 2000;
 
 namespace {
 
-class H4Hci final : public HostHci {
+class H4Hci final : public HostController {
   public:
     explicit H4Hci(H4Target target) : target_(std::move(target)) {}
     ~H4Hci() override { stop(); }
 
-    Return<void> initialize(const sp<IBluetoothHciCallbacks>& callback) override;
+    void start(std::shared_ptr<ControllerClient> client) override;
+    bool send(uint8_t type, const uint8_t* packet, size_t len) override;
+    void stop() override;
 
   private:
     bool isSocket() const { return target_.kind != H4Target::TTY; }
@@ -41,12 +43,10 @@ class H4Hci final : public HostHci {
     void readLoop(int fd);
     void deliver(const H4Packet& packet);
     void endSession(int fd);
-    Return<void> send(uint8_t type, const hidl_vec<uint8_t>& packet) override;
     void logSendFailure(int fd);
-    void stop() override;
 
     const H4Target target_;
-    sp<IBluetoothHciCallbacks> callbacks_;  // set before the reader starts, cleared after it ends
+    std::shared_ptr<ControllerClient> client_;  // set before the reader starts, cleared after it ends
     int wake_ = -1;                         // eventfd: close() wakes the reader
     std::atomic<bool> closing_{false};      // the end of stream ahead is close()'s own
     std::thread reader_;
@@ -54,26 +54,27 @@ class H4Hci final : public HostHci {
     std::mutex lock_;        // guards the fields below
     int fd_ = -1;
     bool connected_ = false;
+    bool gone_ = false;
     bool drop_logged_ = false;
     std::shared_ptr<Btsnoop> snoop_;
 };
 
-Return<void> H4Hci::initialize(const sp<IBluetoothHciCallbacks>& callback) {
-    stop();  // a second initialize starts a fresh session
+void H4Hci::start(std::shared_ptr<ControllerClient> client) {
+    stop();  // a second start begins a fresh session
     wake_ = eventfd(0, EFD_CLOEXEC);
     if (wake_ == -1) {
         HLOGE("h4: eventfd: %s", strerror(errno));
-        callback->initializationComplete(Status::INITIALIZATION_ERROR);
-        return Void();
+        client->initialized(false);
+        return;
     }
-    callbacks_ = callback;
+    client_ = std::move(client);
     {
         std::lock_guard<std::mutex> guard(lock_);
         snoop_ = Btsnoop::fromEnvironment();
         drop_logged_ = false;
+        gone_ = false;
     }
     reader_ = std::thread(&H4Hci::readerMain, this);
-    return Void();
 }
 
 void H4Hci::readerMain() {
@@ -81,7 +82,7 @@ void H4Hci::readerMain() {
     int fd = connect_h4_target(target_, wake_, &why);
     if (fd == -1) {
         HLOGE("h4: cannot reach %s: %s", target_.text.c_str(), why.c_str());
-        callbacks_->initializationComplete(Status::INITIALIZATION_ERROR);
+        client_->initialized(false);
         return;
     }
     {
@@ -90,18 +91,22 @@ void H4Hci::readerMain() {
         connected_ = true;
     }
     HLOGI("h4: connected to %s", target_.text.c_str());
-    callbacks_->initializationComplete(Status::SUCCESS);
+    client_->initialized(true);
     readLoop(fd);
 }
 
-// The controller is gone: the session ends on its side and the service dies.
+// The controller is gone: the session ends on its side, and the client is
+// told once.
 void H4Hci::endSession(int fd) {
+    bool first;
     {
         std::lock_guard<std::mutex> guard(lock_);
         connected_ = false;
+        first = !gone_;
+        gone_ = true;
         if (isSocket()) shutdown(fd, SHUT_RDWR);
     }
-    die();
+    if (first) client_->gone();
 }
 
 void H4Hci::readLoop(int fd) {
@@ -137,42 +142,33 @@ void H4Hci::deliver(const H4Packet& packet) {
         snoop = snoop_;
     }
     if (snoop) snoop->record(packet.type, packet.bytes.data(), packet.bytes.size(), true);
-    hidl_vec<uint8_t> bytes;
-    bytes.setToExternal(const_cast<uint8_t*>(packet.bytes.data()), packet.bytes.size());
-    switch (packet.type) {
-        case H4_TYPE_EVENT: callbacks_->hciEventReceived(bytes); break;
-        case H4_TYPE_ACL: callbacks_->aclDataReceived(bytes); break;
-        case H4_TYPE_SCO: callbacks_->scoDataReceived(bytes); break;
-        default:
-            HLOGE("h4: %s packet from the controller %s dropped: the HAL has no way to deliver it",
-                  h4_type_name(packet.type), target_.text.c_str());
-    }
+    client_->received(packet.type, packet.bytes.data(), packet.bytes.size());
 }
 
-Return<void> H4Hci::send(uint8_t type, const hidl_vec<uint8_t>& packet) {
+bool H4Hci::send(uint8_t type, const uint8_t* packet, size_t len) {
     std::lock_guard<std::mutex> writing(write_lock_);
     int fd;
     std::shared_ptr<Btsnoop> snoop;
     {
         std::lock_guard<std::mutex> guard(lock_);
-        if (hasDied()) return deadObject();
+        if (gone_) return false;
         if (!connected_) {
             if (!drop_logged_) HLOGE("h4: not connected to %s, packets dropped", target_.text.c_str());
             drop_logged_ = true;
-            return Void();
+            return true;
         }
         fd = fd_;
         snoop = snoop_;
     }
     // Captured before the write: the controller's answer may be read, and
     // captured, before a write returns.
-    if (snoop) snoop->record(type, packet.data(), packet.size(), false);
-    if (!h4_send(fd, type, packet.data(), packet.size(), kWriteTimeoutMs)) {
+    if (snoop) snoop->record(type, packet, len, false);
+    if (!h4_send(fd, type, packet, len, kWriteTimeoutMs)) {
         logSendFailure(fd);
         endSession(fd);
-        return deadObject();
+        return false;
     }
-    return Void();
+    return true;
 }
 
 // A stuck write leaves its bytes queued: they are thrown away at once, so that
@@ -211,11 +207,11 @@ void H4Hci::stop() {
     fd_ = -1;
     if (wake_ != -1) ::close(wake_);
     wake_ = -1;
-    callbacks_.clear();
+    client_.reset();
     snoop_.reset();
     closing_.store(false);
 }
 
 }  // namespace
 
-sp<IBluetoothHci> create_h4_hci(const H4Target& target) { return new H4Hci(target); }
+std::unique_ptr<HostController> create_h4_hci(const H4Target& target) { return std::make_unique<H4Hci>(target); }

@@ -1,6 +1,6 @@
-// IBluetoothHci on a simulated controller: sendHciCommand queues the command;
-// the event thread hands it to the controller and delivers the events, so
-// callbacks never run inside the caller's stack. Close joins the thread.
+// A simulated controller behind a host HAL: a command sent is queued; the
+// event thread hands it to the controller and delivers the events, so the
+// client is never called inside the sender's stack. Stop joins the thread.
 #include "host/hal/sim_hci.h"
 
 #include <chrono>
@@ -12,8 +12,8 @@
 #include <vector>
 
 #include "host/hal/btsnoop.h"
-#include "host/hal/host_hci.h"
 #include "host/hal/host_log.h"
+#include "transport/h4_frame.h"
 
 namespace {
 
@@ -23,28 +23,28 @@ std::shared_ptr<SimAir> process_air() {
     return *air;
 }
 
-class SimHci final : public HostHci {
+class SimHci final : public HostController {
   public:
     explicit SimHci(SimControllerSettings settings)
         : settings_(settings), air_(process_air()), controller_(*air_, settings) {}
     ~SimHci() override { stop(); }
 
-    Return<void> initialize(const sp<IBluetoothHciCallbacks>& callback) override;
+    void start(std::shared_ptr<ControllerClient> client) override;
+    bool send(uint8_t type, const uint8_t* packet, size_t len) override;
+    void stop() override;
 
   private:
     struct Work {
         std::vector<uint8_t> command;
     };
-    Return<void> send(uint8_t type, const hidl_vec<uint8_t>& packet) override;
     void eventLoop();
     bool nextWork(Work* work);
     void answer(const std::vector<uint8_t>& command);
-    void stop() override;
 
     const SimControllerSettings settings_;
     std::shared_ptr<SimAir> air_;  // outlives controller_, which runs tests on it
     SimController controller_;     // event thread only (and stop, after the join)
-    sp<IBluetoothHciCallbacks> callbacks_;
+    std::shared_ptr<ControllerClient> client_;
     std::shared_ptr<Btsnoop> snoop_;
     std::mutex lock_;
     std::condition_variable wake_;
@@ -53,29 +53,28 @@ class SimHci final : public HostHci {
     std::thread thread_;
 };
 
-Return<void> SimHci::initialize(const sp<IBluetoothHciCallbacks>& callback) {
-    stop();  // a second initialize starts a fresh session
+void SimHci::start(std::shared_ptr<ControllerClient> client) {
+    stop();  // a second start begins a fresh session
     std::lock_guard<std::mutex> guard(lock_);
-    callbacks_ = callback;
+    client_ = std::move(client);
     snoop_ = Btsnoop::fromEnvironment();
     running_ = true;
     thread_ = std::thread(&SimHci::eventLoop, this);
-    return Void();
 }
 
 // Commands go to the event thread. ACL and SCO data are only captured: the
 // test modes carry none, and a controller in them would discard it too.
-Return<void> SimHci::send(uint8_t type, const hidl_vec<uint8_t>& packet) {
+bool SimHci::send(uint8_t type, const uint8_t* packet, size_t len) {
     std::lock_guard<std::mutex> guard(lock_);
     if (type == H4_TYPE_COMMAND && !running_) {
         HLOGE("sim: command sent outside a session, dropped");
-        return Void();
+        return true;
     }
-    if (snoop_) snoop_->record(type, packet.data(), packet.size(), false);
-    if (type != H4_TYPE_COMMAND) return Void();
-    queue_.push_back({std::vector<uint8_t>(packet.begin(), packet.end())});
+    if (snoop_) snoop_->record(type, packet, len, false);
+    if (type != H4_TYPE_COMMAND) return true;
+    queue_.push_back({std::vector<uint8_t>(packet, packet + len)});
     wake_.notify_one();
-    return Void();
+    return true;
 }
 
 bool SimHci::nextWork(Work* work) {
@@ -96,14 +95,14 @@ void SimHci::answer(const std::vector<uint8_t>& command) {
     }
     for (const auto& event : controller_.command(command.data(), command.size())) {
         if (snoop_) snoop_->record(H4_TYPE_EVENT, event.data(), event.size(), true);
-        callbacks_->hciEventReceived(hidl_vec<uint8_t>(event));
+        client_->received(H4_TYPE_EVENT, event.data(), event.size());
     }
 }
 
-// callbacks_ and snoop_ change only while this thread is not running. The
-// answer to initialize comes first and always, even if close follows at once.
+// client_ and snoop_ change only while this thread is not running. The
+// answer to start comes first and always, even if stop follows at once.
 void SimHci::eventLoop() {
-    callbacks_->initializationComplete(Status::SUCCESS);
+    client_->initialized(true);
     Work work;
     while (nextWork(&work)) answer(work.command);
 }
@@ -118,10 +117,12 @@ void SimHci::stop() {
     if (thread_.joinable()) thread_.join();
     controller_.endTests();
     std::lock_guard<std::mutex> guard(lock_);
-    callbacks_.clear();
+    client_.reset();
     snoop_.reset();
 }
 
 }  // namespace
 
-sp<IBluetoothHci> create_sim_hci(SimControllerSettings settings) { return new SimHci(settings); }
+std::unique_ptr<HostController> create_sim_hci(SimControllerSettings settings) {
+    return std::make_unique<SimHci>(settings);
+}

@@ -1,12 +1,12 @@
-// IBluetoothHci on a simulated controller in this process. Commands are
-// handled and answered on the service's own event thread, as a real HAL
-// answers from its own threads.
+// A simulated controller in this process behind a host HAL service. Commands
+// are handled and answered on the controller's own event thread, as a real
+// HAL answers from its own threads.
 #pragma once
 
-#include <android/hardware/bluetooth/1.0/IBluetoothHci.h>
+#include <memory>
 
+#include "host/hal/host_controller.h"
 #include "host/hal/sim_controller.h"
 
-// A new service with its own controller on the process's shared air.
-android::sp<android::hardware::bluetooth::V1_0::IBluetoothHci> create_sim_hci(
-        SimControllerSettings settings);
+// A new controller on the process's shared air.
+std::unique_ptr<HostController> create_sim_hci(SimControllerSettings settings);
