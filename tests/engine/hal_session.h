@@ -50,14 +50,8 @@ struct Packet {
 };
 using Packets = std::vector<Packet>;
 
-inline void deliver(FakeHal& hal, const Packet& p) {
-    if (p.type == 2) hal.deliverAcl(p.bytes);
-    else if (p.type == 3) hal.deliverSco(p.bytes);
-    else hal.deliverEvent(p.bytes);
-}
-
 // The HCI commands (without H4 type byte) that reached the HAL, in order.
-inline std::vector<Bytes> commandsSent(FakeHal& hal) {
+inline std::vector<Bytes> commandsSent(HalScript& hal) {
     std::vector<Bytes> commands;
     for (const SentPacket& p : hal.sent()) {
         if (p.type == 1) commands.push_back(p.bytes);
@@ -70,8 +64,8 @@ class HalSessionTest : public ::testing::Test {
 
     void SetUp() override {
         hal_ = new FakeHal();
-        hal_->onSend = [this](FakeHal& hal, const SentPacket& packet) {
-            for (const Packet& p : replyTo(packet.bytes)) deliver(hal, p);
+        hal_->onSend = [this](HalScript& hal, const SentPacket& packet) {
+            for (const Packet& p : replyTo(packet.bytes)) hal.deliver(p.type, p.bytes);
         };
         hal_->registerDefault();
         log_.clear();
@@ -88,7 +82,7 @@ class HalSessionTest : public ::testing::Test {
         hidl_client_close_tool_end();
         hidl_client_close();
         android::sp<FakeHal> answering = new FakeHal();
-        answering->onSend = [](FakeHal& hal, const SentPacket& p) { hal.deliverEvent(commandComplete(opcodeOf(p.bytes))); };
+        answering->onSend = [](HalScript& hal, const SentPacket& p) { hal.deliverEvent(commandComplete(opcodeOf(p.bytes))); };
         answering->registerDefault();
         hidl_client_init();
         hci_send_cmd_rawcmd(bt_fd, 0x04, 0x0001, 0, nullptr);

@@ -48,7 +48,7 @@ TEST_P(FaultInjectionTest, EndsWithinItsBoundAndLeavesTheLibraryUsable) {
     hidl_client_close_tool_end();
     hidl_client_close();
     hal_ = new FakeHal();
-    hal_->onSend = [](FakeHal& h, const SentPacket& p) {
+    hal_->onSend = [](HalScript& h, const SentPacket& p) {
         uint16_t opcode = opcodeOf(p.bytes);
         h.deliverEvent(opcode == 0x201F ? commandComplete(opcode, {0x00, 0x2A, 0x00}) : commandComplete(opcode));
     };

@@ -1,6 +1,6 @@
 // The NDK binder as the library relies on it: services found by name, calls that reach the service and
 // bring back its status, death told once, objects alive while anything holds them. Built twice:
-// BINDER_TEST_API 31 against binder_host, 29 against binder_host_api29.
+// BINDER_TEST_API 31 with binder_host_api31 in the process, 29 without it.
 #include <dlfcn.h>
 
 #include <atomic>
