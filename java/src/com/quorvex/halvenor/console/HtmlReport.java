@@ -70,6 +70,7 @@ final class HtmlReport {
     private void setup(Options o) {
         b.append("<h2>Setup</h2>\n<dl class=\"setup\">");
         item("Controller", o.hci);
+        item("Bluetooth HAL", o.hal.toUpperCase(Locale.ROOT));
         item("Date and time", ZonedDateTime.now().format(DateTimeFormatter.ofPattern("yyyy-MM-dd HH:mm:ss z")));
         item("Host", hostName());
         item("Library build", build(Path.of(System.getProperty("java.library.path", ".")).resolve("libhalvenor.so")));

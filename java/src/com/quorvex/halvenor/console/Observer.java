@@ -51,6 +51,11 @@ final class Observer {
         {"E halvenor: serviceDied: the Bluetooth HAL died", "the Bluetooth HAL died"},
         {"E halvenor: hidl_client_initialize: no answer from the HAL", "the Bluetooth HAL did not finish initializing"},
         {"E halvenor: Error in HIDL initialization", "the Bluetooth HAL failed to initialize"},
+        // A cause ending in ": " takes the rest of the line: the AIDL HAL's status, in words.
+        {"E halvenor: initializationComplete: the AIDL HAL failed to initialize: ", "the Bluetooth HAL failed to initialize: "},
+        {"E halvenor: hidl_client_initialize: AIDL initialize failed: ", "the Bluetooth HAL failed to initialize: "},
+        {"E halvenor: hidl_client_initialize: the AIDL HAL died before initialize", "the Bluetooth HAL died"},
+        {" is declared but not running", "the AIDL Bluetooth HAL is declared but not running"},
         {"E halvenor: read_incoming_events: timed out after 2000 ms waiting for the packet type", TIMED_OUT},
         {"E halvenor: read_incoming_events: timed out after 2000 ms waiting for the ",
          "the reply was cut off: its rest did not come within 2000 ms"},
@@ -200,8 +205,9 @@ final class Observer {
                 return host.group(1);
             }
             for (String[] c : CAUSES) {
-                if (library == null && line.contains(c[0])) {
-                    library = c[1];
+                int at = line.indexOf(c[0]);
+                if (library == null && at >= 0) {
+                    library = c[1].endsWith(": ") ? c[1] + line.substring(at + c[0].length()) : c[1];
                 }
             }
         }

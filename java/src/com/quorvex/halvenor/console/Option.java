@@ -58,6 +58,9 @@ record Option(String name, String value, List<String> commands, List<String> req
         new Option("hci", "sim|none|unix:PATH|tcp:HOST:PORT|tty:DEVICE[,BAUD][,rtscts]", RUNS, List.of(),
                    "HALVENOR_HCI", Kind.HCI, 0, 0, "the controller (default: $HALVENOR_HCI, else sim, the simulated one;"
                    + " none: a device without a Bluetooth HAL); rtscts turns on hardware flow control on a serial line"),
+        new Option("hal", "hidl|aidl", RUNS, List.of(), "HALVENOR_HAL", Kind.HAL, 0, 0,
+                   "the host Bluetooth HAL the library reaches the controller through (default: $HALVENOR_HAL, else"
+                   + " hidl); a phone chooses for itself"),
         new Option("btsnoop", "FILE", RUNS, List.of(), "HALVENOR_BTSNOOP", Kind.FILE, 0, 0,
                    "also record every HCI packet in FILE (btsnoop, opens in Wireshark); an existing capture is appended to"),
         new Option("report", "FILE.html", RUNS, List.of(), null, Kind.FILE, 0, 0,

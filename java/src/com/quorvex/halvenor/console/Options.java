@@ -38,6 +38,7 @@ final class Options {
     private final Map<String, Object> values = new HashMap<>();
     String hci;                // from the launcher's HALVENOR_HCI, or sim
     String btsnoop;            // from the launcher's HALVENOR_BTSNOOP, or null
+    String hal = "hidl";       // from the launcher's HALVENOR_HAL: the host HAL served
     /** The simulated controller's settings, as the host layer reads them, when it is the controller. */
     final Map<String, String> simulator = new LinkedHashMap<>();
 
@@ -245,6 +246,7 @@ final class Options {
                                      + " which sets HALVENOR_BTSNOOP");
         }
         btsnoop = envSnoop == null || envSnoop.isEmpty() ? null : envSnoop;
+        hal = checkHal(env.getOrDefault("HALVENOR_HAL", ""));
         if (hci.equals("sim")) {
             String[][] settings = {{"reftx", "1"}, {"loss", "0"}, {"burst", "1"}, {"seed", "0"}, {"delay", "0"}};
             for (String[] setting : settings) {
@@ -252,6 +254,21 @@ final class Options {
                 simulator.put(setting[0], v.isEmpty() ? setting[1] : v);
             }
         }
+    }
+
+    private String checkHal(String envHal) throws UsageException {
+        String value = envHal.isEmpty() ? "hidl" : envHal;
+        String given = text("hal");
+        if (given != null && !given.equalsIgnoreCase(value)) {
+            throw new UsageException("--hal " + given + " must be given to the ./halvenor launcher, which sets HALVENOR_HAL"
+                                     + " (the library sees '" + value + "')");
+        }
+        String hal = value.toLowerCase(Locale.ROOT);
+        if (!hal.matches("hidl|aidl")) {
+            throw new UsageException("bad " + (given != null ? "--hal" : "HALVENOR_HAL") + " '" + value + "': expected "
+                                     + Option.named("hal").range());
+        }
+        return hal;
     }
 
     /**

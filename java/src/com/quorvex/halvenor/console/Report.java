@@ -39,7 +39,7 @@ final class Report {
     void start() {
         synchronized (out) {
             if (!o.flag("json")) {
-                out.println("halvenor " + o.command + " (controller: " + o.hci
+                out.println("halvenor " + o.command + " (controller: " + o.hci + (o.hal.equals("aidl") ? ", HAL: aidl" : "")
                             + (o.btsnoop == null ? "" : ", capture: " + o.btsnoop) + ")");
                 out.println(line(HEADER));
                 out.flush();
@@ -187,6 +187,7 @@ final class Report {
         StringBuilder b = new StringBuilder("{");
         b.append("\"command\":").append(quote(o.command));
         b.append(",\"hci\":").append(quote(o.hci));
+        b.append(",\"hal\":").append(quote(o.hal));
         b.append(",\"btsnoop\":").append(o.btsnoop == null ? "null" : quote(o.btsnoop));
         if (!o.simulator.isEmpty()) {
             b.append(",\"simulator\":{");

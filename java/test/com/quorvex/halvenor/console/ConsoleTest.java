@@ -31,6 +31,7 @@ import org.junit.jupiter.api.Test;
 import org.junit.jupiter.params.ParameterizedTest;
 import org.junit.jupiter.params.provider.Arguments;
 import org.junit.jupiter.params.provider.CsvSource;
+import org.junit.jupiter.params.provider.ValueSource;
 import org.junit.jupiter.params.provider.MethodSource;
 
 @Tag("console")
@@ -50,6 +51,8 @@ class ConsoleTest {
         env.put("HALVENOR_NO_BUILD", "1");
         env.put("HALVENOR_HCI", null);
         env.put("HALVENOR_BTSNOOP", null);
+        env.put("HALVENOR_HAL", null);
+        env.put("HALVENOR_AIDL_HELD", null);
         env.put("JAVA_TOOL_OPTIONS", "-Xcheck:jni");  // the console's JVM checks every JNI call the library makes
         for (int i = 0; i < pairs.length; i += 2) {
             env.put(pairs[i], pairs[i + 1]);
@@ -119,13 +122,14 @@ class ConsoleTest {
         assertFalse((c.stdout() + c.stderr()).contains("WARNING in native method"), "JNI used as it must be: " + c.stderr());
     }
 
-    @Test
-    void demoTourPassesAgainstSimulatedController() throws Exception {
-        Child c = halvenor("demo");
+    @ParameterizedTest(name = "{0}")
+    @ValueSource(strings = {"hidl", "aidl"})
+    void demoTourPassesAgainstSimulatedController(String hal) throws Exception {
+        Child c = halvenor("--hal", hal, "demo");
 
         assertEquals(0, c.status(), c.stdout() + c.stderr());
         String out = c.stdout();
-        assertTrue(out.startsWith("halvenor demo (controller: sim)"), out);
+        assertTrue(out.startsWith("halvenor demo (controller: sim" + (hal.equals("aidl") ? ", HAL: aidl)" : ")")), out);
         List<String> rows = out.lines().filter(l -> l.matches("^(dut on|dut off|rx|cw) .*")).toList();
         assertEquals(9, rows.size(), out);
         assertTrue(rows.stream().allMatch(r -> r.endsWith(" ok")), out);
@@ -197,12 +201,15 @@ class ConsoleTest {
         assertEquals(all, commands(snoop));
     }
 
-    @Test
-    void verboseShowsLibraryLogLinesAndTraceDecodesTheTraffic() throws Exception {
-        Child c = halvenor("--verbose", "--trace", "rx", "--freq", "2440", "--phy", "2M", "--duration", "0.2", "--min-packets", "100");
+    /** The library's own line says which HAL it opened. */
+    @ParameterizedTest(name = "{0}")
+    @CsvSource({"hidl,hidl_client_initialize: HIDL = true", "aidl,hidl_client_initialize: AIDL = true"})
+    void verboseShowsLibraryLogLinesAndTraceDecodesTheTraffic(String hal, String opened) throws Exception {
+        Child c = halvenor("--hal", hal, "--verbose", "--trace", "rx", "--freq", "2440", "--phy", "2M", "--duration", "0.2",
+                           "--min-packets", "100");
 
         assertEquals(0, c.status(), c.stderr());
-        for (String line : List.of("sendBleTestCommand, init smd successful",
+        for (String line : List.of(opened, "sendBleTestCommand, init smd successful",
                                    "< HCI Command: LE Receiver Test v2 (0x08|0x0033) plen 3", "PHY: LE 2M (0x02)",
                                    "> HCI Event: Command Complete (0x0e) plen 6", "Number of packets: ")) {
             assertTrue(c.stderr().contains(line), line + " in " + c.stderr());
@@ -211,7 +218,18 @@ class ConsoleTest {
 
     private static final List<String> RX_1M = List.of("rx", "--freq", "2440", "--phy", "1M", "--duration", "0.3");
 
+    /** Every row over HIDL; the rows where the HAL dies with its controller over AIDL too. */
     static Stream<Arguments> controllerAnswers() {
+        List<Arguments> rows = answerRows().toList();
+        return Stream.concat(rows.stream().map(a -> withHal("hidl", a)),
+                             rows.stream().filter(a -> a.get()[0].toString().startsWith("closes")).map(a -> withHal("aidl", a)));
+    }
+
+    private static Arguments withHal(String hal, Arguments row) {
+        return Arguments.of(Stream.concat(Stream.of(hal), Stream.of(row.get())).toArray());
+    }
+
+    static Stream<Arguments> answerRows() {
         int rx = 0x201d;
         return Stream.of(
             Arguments.of("refused", Map.of(0x2033, List.of(ScriptedController.complete(0x2033, 0x11))),
@@ -257,13 +275,13 @@ class ConsoleTest {
                          "%s: controller closed the connection"));
     }
 
-    @ParameterizedTest(name = "{0}")
+    @ParameterizedTest(name = "{0}: {1}")
     @MethodSource("controllerAnswers")
-    void okMeansTheControllerAcceptedEveryCommand(String name, Map<Integer, List<ScriptedController.Act>> script,
+    void okMeansTheControllerAcceptedEveryCommand(String hal, String name, Map<Integer, List<ScriptedController.Act>> script,
                                                   List<String> args, String failure) throws Exception {
         try (ScriptedController controller = new ScriptedController(work.resolve("scripted.sock"), script)) {
             long start = System.nanoTime();
-            Child c = Child.run(command(concat(List.of("--json", "--hci", controller.hci()), args)), environment(), 60);
+            Child c = Child.run(command(concat(List.of("--json", "--hal", hal, "--hci", controller.hci()), args)), environment(), 60);
             double took = (System.nanoTime() - start) / 1e9;
 
             // A receiver step's 0.3 s is too short for a verdict: inconclusive, 4.
@@ -295,20 +313,29 @@ class ConsoleTest {
         }
     }
 
+    /**
+     * Over either HAL; with neither (none), the library tries HIDL and says so. An AIDL HAL
+     * held by another client, as a phone's is while its own Bluetooth is on, is not taken.
+     */
     static Stream<Arguments> unreachable() {
-        return Stream.of(Arguments.of("unix:/nothing/listens/here", "sweep",
+        List<Arguments> rows = List.of(Arguments.of("unix:/nothing/listens/here", "sweep",
                          "no controller reachable: unix:/nothing/listens/here: connect: No such file or directory"),
             Arguments.of("tty:/dev/null,115200,rtscts", "sweep",
                          "no controller reachable: tty:/dev/null,115200,rtscts: not a serial line"),
             Arguments.of("none", "dut on", "no controller reachable: no Bluetooth HAL service"));
+        return Stream.concat(Stream.of("hidl", "aidl").flatMap(hal -> rows.stream().map(a -> withHal(hal, a))),
+            Stream.of(Arguments.of("aidl held", "sim", "dut on", "no controller reachable: the Bluetooth HAL failed to"
+                                   + " initialize: ALREADY_INITIALIZED: the HAL is in use, usually by the phone's own"
+                                   + " Bluetooth: turn Bluetooth off and try again")));
     }
 
-    @ParameterizedTest(name = "{0}")
+    @ParameterizedTest(name = "{0}: {1}")
     @MethodSource("unreachable")
-    void unreachableControllerNamesTheCause(String hci, String command, String why) throws Exception {
+    void unreachableControllerNamesTheCause(String hal, String hci, String command, String why) throws Exception {
         Path page = fresh("unreachable.html");
-        Child c = Child.run(command(concat(List.of("--hci", hci, "--report", page.toString()), List.of(command.split(" ")))),
-                            environment(), 60);
+        Child c = Child.run(command(concat(List.of("--hal", hal.split(" ")[0], "--hci", hci, "--report", page.toString()),
+                                           List.of(command.split(" ")))),
+                            environment("HALVENOR_AIDL_HELD", hal.endsWith("held") ? "1" : null), 60);
 
         assertEquals(1, c.status(), c.stdout() + c.stderr());
         assertTrue(c.stdout().contains(": " + why), c.stdout());
@@ -348,7 +375,8 @@ class ConsoleTest {
             Arguments.of(List.of("USER=nobody", "--csv", "/root/x.csv", "dut", "off"), "bad --csv '/root/x.csv': Permission denied"),
             Arguments.of(List.of("frobnicate"), "use demo, dut on, dut off, tx, rx, sweep, cw, sim or help"),
             Arguments.of(List.of("help", "frobnicate"), "unknown command 'frobnicate'"),
-            Arguments.of(List.of("HALVENOR_HCI=tcp:localhost", "demo"), "bad HALVENOR_HCI 'tcp:localhost'"));
+            Arguments.of(List.of("HALVENOR_HCI=tcp:localhost", "demo"), "bad HALVENOR_HCI 'tcp:localhost'"),
+            Arguments.of(List.of("--hal", "binder", "demo"), "bad --hal 'binder': expected hidl or aidl"));
     }
 
     /** A leading NAME=VALUE sets the environment instead; USER=nobody runs the launcher as nobody. */
