@@ -1,7 +1,7 @@
-// A controller speaking H4 on a stream. The reader thread connects (bounded),
-// tells the client once whether it could, then reassembles the controller's
-// stream into packets for the client until stop, end of stream or a byte
-// that starts no packet.
+// A controller speaking H4 on a stream or an adapter's user channel. The
+// reader thread connects (bounded), tells the client once whether it could,
+// then reassembles the controller's stream into packets for the client until
+// stop, end of stream or a byte that starts no packet.
 #include "host/hal/h4_hci.h"
 
 #include <errno.h>
@@ -16,15 +16,19 @@
 #include <memory>
 #include <mutex>
 #include <thread>
+#include <vector>
 
 #include "host/hal/btsnoop.h"
 #include "host/hal/h4_io.h"
 #include "host/hal/h4_stream.h"
+#include "host/hal/hci_user.h"
 #include "host/hal/host_log.h"
 
 // A controller that takes no byte of a packet for this long is stuck: the
 // library's own reply time-out.
 static const int kWriteTimeoutMs = 2000;
+// A user channel's read returns one whole packet, or loses its rest: room for the largest.
+static const size_t kReadBytes = 1 + 4 + 65535;
 
 namespace {
 
@@ -38,7 +42,11 @@ class H4Hci final : public HostController {
     void stop() override;
 
   private:
-    bool isSocket() const { return target_.kind != H4Target::TTY; }
+    // A user channel's descriptor shares its socket with the one kept bound,
+    // which a shutdown would end too.
+    bool shutsDown() const { return target_.kind == H4Target::UNIX || target_.kind == H4Target::TCP; }
+    bool isTty() const { return target_.kind == H4Target::TTY; }
+    bool isAdapter() const { return target_.kind == H4Target::USER; }
     void readerMain();
     void readLoop(int fd);
     void deliver(const H4Packet& packet);
@@ -81,7 +89,7 @@ void H4Hci::readerMain() {
     std::string why;
     int fd = connect_h4_target(target_, wake_, &why);
     if (fd == -1) {
-        HLOGE("h4: cannot reach %s: %s", target_.text.c_str(), why.c_str());
+        HLOGE("h4: cannot %s %s: %s", isAdapter() ? "take" : "reach", target_.text.c_str(), why.c_str());
         client_->initialized(false);
         return;
     }
@@ -104,20 +112,27 @@ void H4Hci::endSession(int fd) {
         connected_ = false;
         first = !gone_;
         gone_ = true;
-        if (isSocket()) shutdown(fd, SHUT_RDWR);
+        if (shutsDown()) shutdown(fd, SHUT_RDWR);
     }
+    if (isAdapter()) hci_user_lost(target_.port);
     if (first) client_->gone();
 }
 
 void H4Hci::readLoop(int fd) {
     H4Stream stream;
-    uint8_t buf[4096];
+    std::vector<uint8_t> buf(kReadBytes);
     auto sink = [this](const H4Packet& packet) { deliver(packet); };
     std::string why;
     while (h4_wait_for(fd, POLLIN, wake_, -1, &why)) {
-        ssize_t n = read(fd, buf, sizeof(buf));
+        ssize_t n = read(fd, buf.data(), buf.size());
         if (n < 0 && (errno == EINTR || errno == EAGAIN)) continue;
         if (n <= 0 && closing_.load()) return;
+        if (n <= 0 && isAdapter()) {
+            // EPIPE or ENODEV: the kernel removed it, or took it back.
+            HLOGE("h4: %s: the adapter went away%s%s", target_.text.c_str(), n == 0 ? "" : ": ",
+                  n == 0 ? "" : strerror(errno));
+            return endSession(fd);
+        }
         if (n <= 0) {
             if (n == 0) {
                 HLOGE("h4: %s: controller closed the connection%s", target_.text.c_str(),
@@ -127,7 +142,7 @@ void H4Hci::readLoop(int fd) {
             }
             return endSession(fd);
         }
-        if (!stream.feed(buf, static_cast<size_t>(n), sink)) {
+        if (!stream.feed(buf.data(), static_cast<size_t>(n), sink)) {
             HLOGE("h4: %s: controller sent unknown packet type 0x%02x, connection closed",
                   target_.text.c_str(), stream.badType());
             return endSession(fd);
@@ -180,8 +195,8 @@ void H4Hci::logSendFailure(int fd) {
         return;
     }
     HLOGE("h4: %s: the controller is not taking bytes (%s for %d s)", target_.text.c_str(),
-          isSocket() ? "its connection full" : "flow control held", kWriteTimeoutMs / 1000);
-    if (!isSocket()) tcflush(fd, TCOFLUSH);
+          isTty() ? "flow control held" : "its connection full", kWriteTimeoutMs / 1000);
+    if (isTty()) tcflush(fd, TCOFLUSH);
 }
 
 // Wakes the reader (and, on a socket, a blocked writer), joins it, and only
@@ -191,7 +206,7 @@ void H4Hci::stop() {
     {
         std::lock_guard<std::mutex> guard(lock_);
         connected_ = false;
-        if (fd_ != -1 && isSocket()) shutdown(fd_, SHUT_RDWR);
+        if (fd_ != -1 && shutsDown()) shutdown(fd_, SHUT_RDWR);
     }
     if (wake_ != -1) {
         uint64_t one = 1;
@@ -202,7 +217,7 @@ void H4Hci::stop() {
     std::lock_guard<std::mutex> writing(write_lock_);
     std::lock_guard<std::mutex> guard(lock_);
     // Output still held by flow control would make close() wait for it.
-    if (fd_ != -1 && !isSocket()) tcflush(fd_, TCOFLUSH);
+    if (fd_ != -1 && isTty()) tcflush(fd_, TCOFLUSH);
     if (fd_ != -1) ::close(fd_);
     fd_ = -1;
     if (wake_ != -1) ::close(wake_);

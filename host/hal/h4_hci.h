@@ -1,5 +1,5 @@
-// A controller speaking H4 on a stream behind a host HAL service: a unix or
-// TCP socket, or a serial line. A reader thread per session connects, reports
+// A controller speaking H4 behind a host HAL service: on a unix or TCP
+// socket, a serial line, or an adapter's HCI user channel. A reader thread per session connects, reports
 // whether it could and delivers the controller's packets; any thread may send.
 #pragma once
 

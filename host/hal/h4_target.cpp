@@ -1,6 +1,6 @@
-// Where an H4 controller is and how to reach it: the unix:, tcp: and tty:
-// values of HALVENOR_HCI, and opening a descriptor to the controller (a
-// bounded connect and name resolution, a raw serial line). Runs on the
+// Where an H4 controller is and how to reach it: the unix:, tcp:, tty: and
+// hci: values of HALVENOR_HCI, and opening a descriptor to the controller (a
+// bounded connect and name resolution, a raw serial line, a user channel). Runs on the
 // service's reader thread; the resolver may finish on a thread of its own.
 #include "host/hal/h4_target.h"
 
@@ -23,6 +23,8 @@
 #include <memory>
 #include <mutex>
 #include <thread>
+
+#include "host/hal/hci_user.h"
 
 // A controller that has not answered a connect by then is not coming.
 static const int kConnectTimeoutMs = 3000;
@@ -48,12 +50,12 @@ static bool baud_speed(int baud, speed_t* speed) {
     return false;
 }
 
-// A whole decimal number in 1..max, else -1.
-static long parse_number(const std::string& text, long max) {
+// A whole decimal number in min..max, else -1.
+static long parse_number(const std::string& text, long max, long min = 1) {
     if (text.empty() || text.find_first_not_of("0123456789") != std::string::npos) return -1;
     if (text.size() > 9) return -1;
     long n = strtol(text.c_str(), nullptr, 10);
-    return n >= 1 && n <= max ? n : -1;
+    return n >= min && n <= max ? n : -1;
 }
 
 // "DEVICE[,BAUD][,rtscts]": many UART boards need RTS/CTS to keep up.
@@ -109,7 +111,14 @@ bool parse_h4_target(const std::string& value, H4Target* t, std::string* why) {
         t->kind = H4Target::TTY;
         return parse_tty(rest, t, why);
     }
-    *why = "expected sim, none, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]";
+    if (colon != std::string::npos && kind == "hci") {
+        t->kind = H4Target::USER;
+        // 65535 is the kernel's "no adapter".
+        t->port = static_cast<int>(parse_number(rest, 65534, 0));
+        if (t->port < 0) return *why = "adapter index '" + rest + "' is not in 0..65534", false;
+        return true;
+    }
+    *why = "expected sim, none, unix:PATH, tcp:HOST:PORT, tty:DEVICE[,BAUD][,rtscts] or hci:N";
     return false;
 }
 
@@ -253,6 +262,7 @@ int connect_h4_target(const H4Target& t, int wake, std::string* why) {
         case H4Target::UNIX: return connect_unix(t, wake, why);
         case H4Target::TCP: return connect_tcp(t, wake, why);
         case H4Target::TTY: return open_tty(t, why);
+        case H4Target::USER: return hci_user_take(t.port, wake, why);
     }
     return -1;
 }

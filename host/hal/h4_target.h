@@ -1,6 +1,6 @@
-// Where an H4 controller is and how to reach it: parsing the unix:, tcp: and
-// tty: values of HALVENOR_HCI, and opening a non-blocking descriptor to the
-// controller. Any thread.
+// Where an H4 controller is and how to reach it: parsing the unix:, tcp:,
+// tty: and hci: values of HALVENOR_HCI, and opening a non-blocking descriptor
+// to the controller. Any thread.
 #pragma once
 
 #include <netdb.h>
@@ -8,15 +8,15 @@
 #include <string>
 
 struct H4Target {
-    enum Kind { UNIX, TCP, TTY } kind;
+    enum Kind { UNIX, TCP, TTY, USER } kind;  // USER: an adapter's HCI user channel
     std::string text;  // as given, for log lines
     std::string path;  // socket path, host name or device
-    int port = 0;
+    int port = 0;   // TCP port, or the adapter index of hci:N
     int baud = 115200;
     bool rtscts = false;  // hardware flow control on a serial line
 };
 
-// Parses "unix:PATH", "tcp:HOST:PORT" or "tty:DEVICE[,BAUD][,rtscts]". On failure
+// Parses "unix:PATH", "tcp:HOST:PORT", "tty:DEVICE[,BAUD][,rtscts]" or "hci:N". On failure
 // returns false with the reason in *why.
 bool parse_h4_target(const std::string& value, H4Target* target, std::string* why);
 

@@ -35,7 +35,7 @@ TEST_F(DefaultServiceTest, UnusableSettingLogsOnceAndFailsTheSession) {
         const char* value;
         const char* reason;  // part of the log line
     } cases[] = {
-            {"HALVENOR_HCI", "bogus", "expected sim, none, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]"},
+            {"HALVENOR_HCI", "bogus", "expected sim, none, unix:PATH, tcp:HOST:PORT, tty:DEVICE[,BAUD][,rtscts] or hci:N"},
             {"HALVENOR_HCI", "unix:", "no path after unix:"}, {"HALVENOR_HCI", "tty:", "no device after tty:"},
             {"HALVENOR_HCI", "tcp:localhost", "expected tcp:HOST:PORT"},
             {"HALVENOR_HCI", "tcp:127.0.0.1:70000", "port '70000' is not in 1..65535"},

@@ -1,8 +1,11 @@
-// The H4 backends against a real far end, a unix listener or a
-// pseudo-terminal: packets both ways, reassembly, a controller that leaves or
-// stops taking bytes; and the capture they write.
+// The H4 backends against a real far end, a unix listener, a pseudo-terminal
+// or an adapter's user channel (a SOCK_SEQPACKET pair in the kernel's place):
+// packets both ways, reassembly, a controller that leaves or stops taking
+// bytes; the user channel's bind errors and its binding once; and the capture
+// they write.
 #include "host/hal/h4_hci.h"
 #include "host/hal/btsnoop.h"
+#include "host/hal/hci_user.h"
 
 #include <netdb.h>
 
@@ -18,6 +21,7 @@
 #include <chrono>
 #include <fstream>
 #include <iterator>
+#include <map>
 #include <memory>
 #include <thread>
 
@@ -95,6 +99,47 @@ class PtyFarEnd : public FarEnd {
     int held_ = -1;
 };
 
+// The kernel's side of adapter hciN's user channel: one packet per read and
+// per write, as the kernel gives them. Each far end has an index of its own,
+// since a channel, once taken, is kept for the life of the process.
+std::map<int, int> g_channels;  // index -> the backend's end, until taken
+std::map<int, int> g_binds;     // index -> times bound
+
+int pairOpener(int index) {
+    ++g_binds[index];
+    auto it = g_channels.find(index);
+    if (it == g_channels.end()) return errno = ENODEV, -1;
+    int fd = it->second;
+    g_channels.erase(it);
+    return fd;
+}
+
+class HciFarEnd : public FarEnd {
+  public: HciFarEnd() {
+        static int next_index = 100;
+        index_ = next_index++;
+        int pair[2];
+        socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, pair);
+        fd = pair[0];
+        g_channels[index_] = pair[1];
+        hci_user_use_opener(pairOpener);
+    }
+    ~HciFarEnd() override { hci_user_use_opener(nullptr); }
+    std::string hci() override { return "hci:" + std::to_string(index_); }
+    bool accept() override { return true; }
+    // Gives the kernel's end a new descriptor, as an adapter that came back.
+    void plugIn() {
+        int pair[2];
+        socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, pair);
+        close(fd);
+        fd = pair[0];
+        g_channels[index_] = pair[1];
+    }
+    int binds() { return g_binds[index_]; }
+
+  private: int index_;
+};
+
 using FarEndFactory = std::unique_ptr<FarEnd> (*)();
 
 class H4HciTest : public ::testing::TestWithParam<FarEndFactory> {
@@ -169,9 +214,12 @@ TEST_P(H4HciTest, CarriesPacketsBothWaysAndDiesWithItsController) {
 TEST_P(H4HciTest, ControllerClosingKillsTheService) {
     connect();
     far->hangUp();
-    // A pseudo-terminal's hang-up is an error to read, a socket's an end of stream.
-    ASSERT_TRUE(waitUntil([&] { return log.containsFragment(far->listener < 0 ? "h4: " + far->hci() + ": "
-                                                                             : "controller closed the connection"); }));
+    // A pseudo-terminal's hang-up is an error to read, a socket's an end of stream, an adapter's its removal.
+    std::string target = far->hci();
+    std::string line = target.rfind("tty:", 0) == 0 ? "h4: " + target + ": "
+                       : target.rfind("hci:", 0) == 0 ? "h4: " + target + ": the adapter went away"
+                                                      : "controller closed the connection";
+    ASSERT_TRUE(waitUntil([&] { return log.containsFragment(line); })) << line;
     EXPECT_TRUE(hci->sendHciCommand(hidl_vec<uint8_t>({0x03, 0x0C, 0x00})).isDeadObject());
 }
 
@@ -261,12 +309,84 @@ TEST(BtsnoopTest, ConsoleCaptureIgnoresAStepOfTheWallClock) {
 
 std::unique_ptr<FarEnd> unixFarEnd() { return std::unique_ptr<FarEnd>(new UnixFarEnd()); }
 std::unique_ptr<FarEnd> ptyFarEnd() { return std::unique_ptr<FarEnd>(new PtyFarEnd()); }
+std::unique_ptr<FarEnd> hciFarEnd() { return std::unique_ptr<FarEnd>(new HciFarEnd()); }
 
 std::string backendName(const ::testing::TestParamInfo<FarEndFactory>& info) {
-    const char* names[] = {"Unix", "Tty"};
+    const char* names[] = {"Unix", "Tty", "UserChannel"};
     return names[info.index];
 }
 
-INSTANTIATE_TEST_SUITE_P(Backends, H4HciTest, ::testing::Values(unixFarEnd, ptyFarEnd), backendName);
+INSTANTIATE_TEST_SUITE_P(Backends, H4HciTest, ::testing::Values(unixFarEnd, ptyFarEnd, hciFarEnd), backendName);
+
+// The channel is bound once and kept across the library's sessions, so the
+// system cannot take the adapter back between them; an adapter that went
+// away is bound anew, and what the kernel refuses says what to do.
+TEST(HciUserTest, BoundOnceAcrossSessionsAndAnewAfterTheAdapterWentAway) {
+    HciFarEnd far;
+    for (int session = 0; session < 3; ++session) {
+        sp<IBluetoothHci> hci = serviceFor(far.hci().c_str());
+        sp<RecordingCallbacks> callbacks = new RecordingCallbacks();
+        hci->initialize(callbacks);
+        HciStatus status;
+        ASSERT_TRUE(callbacks->waitForInit(&status));
+        ASSERT_EQ(HciStatus::SUCCESS, status) << session;
+        EXPECT_TRUE(hci->sendHciCommand(hidl_vec<uint8_t>({0x03, 0x0C, 0x00})).isOk());
+        EXPECT_EQ(h4(1, {0x03, 0x0C, 0x00}), readBytes(far.fd, 4)) << session;
+        if (session == 1) {
+            far.plugIn();  // the old end closed: the adapter went away, and came back
+            EXPECT_TRUE(waitUntil([&] { return hci->sendHciCommand(hidl_vec<uint8_t>({0x03, 0x0C, 0x00})).isDeadObject(); }));
+        } else {
+            hci->close().isOk();
+        }
+        EXPECT_EQ(session < 2 ? 1 : 2, far.binds()) << session;
+    }
+    unsetenv("HALVENOR_HCI");
+}
+
+struct BindRefusal {
+    std::vector<int> errors;  // what each bind gives, the last one for good
+    const char* line;         // null: bound in the end
+};
+
+std::vector<int> g_refusals;
+int refusingOpener(int) {
+    int err = g_refusals.size() > 1 ? g_refusals.front() : g_refusals.back();
+    if (g_refusals.size() > 1) g_refusals.erase(g_refusals.begin());
+    if (err == 0) return socket(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0);
+    return errno = err, -1;
+}
+
+TEST(HciUserTest, EachBindRefusalSaysWhatToDo) {
+    const BindRefusal kRefusals[] = {
+            {{EAFNOSUPPORT}, "this kernel has no Bluetooth (no AF_BLUETOOTH sockets): load its module with modprobe "
+                             "bluetooth, or use a kernel built with Bluetooth"},
+            {{EPERM}, "no permission: the HCI user channel needs CAP_NET_ADMIN; run as root, e.g. with sudo (a file "
+                      "capability on java does not work: its launcher then fails to find its own libraries)"},
+            {{EBUSY}, "the adapter is up or in use, for example by the system's Bluetooth service: bring it down, e.g. "
+                      "btmgmt --index 7 power off, or stop the service (systemctl stop bluetooth)"},
+            {{ENODEV}, "there is no adapter hci7; the kernel knows no Bluetooth adapter here"},
+            {{EINVAL}, "the kernel refused adapter index 7 (Invalid argument)"},
+            {{EBUSY, EBUSY, 0}, nullptr},  // the kernel's own setup of a new adapter, waited out
+    };
+    LogCapture log;
+    hci_user_use_opener(refusingOpener);
+    for (const BindRefusal& r : kRefusals) {
+        g_refusals = r.errors;
+        log.clear();
+        sp<IBluetoothHci> hci = serviceFor("hci:7");
+        sp<RecordingCallbacks> callbacks = new RecordingCallbacks();
+        hci->initialize(callbacks);
+        HciStatus status;
+        ASSERT_TRUE(callbacks->waitForInit(&status));
+        EXPECT_EQ(r.line == nullptr ? HciStatus::SUCCESS : HciStatus::INITIALIZATION_ERROR, status);
+        if (r.line != nullptr) {
+            EXPECT_TRUE(log.contains(ANDROID_LOG_ERROR, std::string("h4: cannot take hci:7: ") + r.line)) << r.line;
+        }
+        hci->close().isOk();
+    }
+    hci_user_lost(7);
+    hci_user_use_opener(nullptr);
+    unsetenv("HALVENOR_HCI");
+}
 
 }  // namespace
