@@ -1,6 +1,7 @@
 // halvenor-sim: serves simulated controllers as H4 on a unix socket or a
-// loopback TCP port, one controller per connection, all on one air. The main
-// thread accepts; SIGINT and SIGTERM stop it cleanly.
+// loopback TCP port, one controller per connection, all on one air, or one
+// controller to the kernel through /dev/vhci. The main thread accepts (or
+// serves the one); SIGINT and SIGTERM stop it cleanly.
 #include <fcntl.h>
 #include <signal.h>
 #include <stdio.h>
@@ -24,6 +25,12 @@ static void on_signal(int) {
 static bool take_unix(const char* text, SimServerOptions* o, std::string* range) {
     if (*text == '\0') return *range = "a socket path", false;
     o->unix_path = text;
+    return true;
+}
+
+static bool take_vhci(const char* text, SimServerOptions* o, std::string* range) {
+    if (*text == '\0') return *range = "a device, /dev/vhci", false;
+    o->vhci = text;
     return true;
 }
 
@@ -51,6 +58,8 @@ struct OptionRow {
 static const OptionRow kOptions[] = {
         {"unix", "PATH", "listen on a unix socket", take_unix, nullptr},
         {"tcp", "PORT", "listen on 127.0.0.1:PORT, 0 to 65535 (the default; 0 picks a free port)", take_tcp, nullptr},
+        {"vhci", "DEVICE", "serve one controller to this machine's kernel through DEVICE (/dev/vhci): it appears"
+                           " as an adapter, for --hci hci:N (Linux, root)", take_vhci, nullptr},
         {"reftx", "0|1", "1: a reference transmitter follows every receiver test (default 0)", nullptr, sim_take_reftx},
         {"loss", "FRACTION", "share of packets each receiver misses at random, 0 to 1 (default 0)", nullptr, sim_take_loss},
         {"burst", "PACKETS", "mean length of a burst of lost packets, 1 to 1000 (default 1: each on its own)", nullptr,
@@ -60,7 +69,7 @@ static const OptionRow kOptions[] = {
 };
 
 static void usage(FILE* out) {
-    fprintf(out, "usage: halvenor-sim [--unix PATH | --tcp PORT] [options]\n");
+    fprintf(out, "usage: halvenor-sim [--unix PATH | --tcp PORT | --vhci DEVICE] [options]\n");
     for (const OptionRow& o : kOptions) {
         std::string left = std::string("--") + o.name + " " + o.value;
         fprintf(out, "  %-18s %s\n", left.c_str(), o.help);  // a test holds these to the console's table
@@ -107,11 +116,26 @@ static bool parse_args(int argc, char** argv, SimServerOptions* options) {
         if (eq != std::string::npos && *value == '\0') value = nullptr;
         if (!take(name, value, options)) return false;
     }
-    if (!options->unix_path.empty() && options->tcp_given) {
-        fprintf(stderr, "halvenor-sim: --unix and --tcp exclude each other: give one\n");
+    if (!options->unix_path.empty() + options->tcp_given + !options->vhci.empty() > 1) {
+        fprintf(stderr, "halvenor-sim: %s exclude each other: give one\n",
+                options->vhci.empty() ? "--unix and --tcp" : "--unix, --tcp and --vhci");
         return false;
     }
     return true;
+}
+
+static int serve_vhci(const SimServerOptions& options) {
+    std::string where, why;
+    int fd = sim_server_vhci(options.vhci, &where, &why);
+    if (fd == -1) {
+        fprintf(stderr, "halvenor-sim: %s\n", why.c_str());
+        return 1;
+    }
+    printf("serving %s through %s\n", where.c_str(), options.vhci.c_str());
+    fflush(stdout);
+    sim_server_serve(fd, stop_pipe[0], options.controller);
+    close(fd);  // the kernel removes the adapter
+    return 0;
 }
 
 int main(int argc, char** argv) {
@@ -135,6 +159,7 @@ int main(int argc, char** argv) {
     signal(SIGTERM, on_signal);
 
     std::string where, why;
+    if (!options.vhci.empty()) return serve_vhci(options);
     int listen_fd = sim_server_listen(options, &where, &why);
     if (listen_fd == -1) {
         fprintf(stderr, "halvenor-sim: %s\n", why.c_str());

@@ -5,6 +5,7 @@
 
 #include <arpa/inet.h>
 #include <errno.h>
+#include <fcntl.h>
 #include <netinet/in.h>
 #include <netinet/tcp.h>
 #include <poll.h>
@@ -78,8 +79,9 @@ int sim_server_listen(const SimServerOptions& options, std::string* where, std::
     return listen_tcp(options.tcp_port, where, why);
 }
 
-// One connection: commands in, the controller's events out, in order.
-static void serve_connection(int fd, SimAir* air, SimControllerSettings settings) {
+// One connection: commands in, the controller's events out, in order, until
+// its end or until stop_fd (-1: none) becomes readable.
+static void serve_connection(int fd, int stop_fd, SimAir* air, SimControllerSettings settings) {
     SimController controller(*air, settings);
     H4Stream stream;
     uint8_t buf[4096];
@@ -91,6 +93,10 @@ static void serve_connection(int fd, SimAir* air, SimControllerSettings settings
         }
     };
     for (;;) {
+        struct pollfd pfds[2] = {{fd, POLLIN, 0}, {stop_fd, POLLIN, 0}};
+        if (poll(pfds, 2, -1) == -1 && errno != EINTR) break;
+        if (pfds[1].revents != 0) break;
+        if (pfds[0].revents == 0) continue;
         ssize_t n = read(fd, buf, sizeof(buf));
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0 || !writable) break;
@@ -149,11 +155,48 @@ void sim_server_run(int listen_fd, int stop_fd, const SimControllerSettings& set
         c->fd = fd;
         Connection* raw = c.get();
         c->thread = std::thread([raw, &air, settings] {
-            serve_connection(raw->fd, &air, settings);
+            serve_connection(raw->fd, -1, &air, settings);
             raw->done.store(true);
         });
         reap_connections(connections);
         connections.push_back(std::move(c));
     }
     stop_connections(connections);
+}
+
+// The kernel answers a create request with the new adapter's index.
+static bool read_vhci_index(int fd, int* index, std::string* why) {
+    struct pollfd pfd = {fd, POLLIN, 0};
+    uint8_t reply[4];
+    if (poll(&pfd, 1, 2000) != 1) return *why = "the kernel did not answer the create request within 2 s", false;
+    ssize_t n = read(fd, reply, sizeof(reply));
+    if (n != 4 || reply[0] != 0xff || reply[1] != 0x80) return *why = "the kernel's answer to the create request is not one", false;
+    *index = reply[2] | reply[3] << 8;
+    return true;
+}
+
+int sim_server_vhci(const std::string& device, std::string* where, std::string* why) {
+    int fd = open(device.c_str(), O_RDWR | O_CLOEXEC);
+    if (fd == -1) {
+        int err = errno;
+        *why = "cannot open " + device + ": " + strerror(err) +
+               (err == ENOENT ? " (load the driver: modprobe hci_vhci)" : err == EACCES ? " (run as root)" : "");
+        return -1;
+    }
+    // 0x80: a raw adapter, which the kernel leaves to whoever takes its user channel.
+    const uint8_t create[] = {0xff, 0x80};
+    int index = 0;
+    if (write(fd, create, sizeof(create)) != sizeof(create)) {
+        *why = "create request to " + device + ": " + strerror(errno);
+    } else if (read_vhci_index(fd, &index, why)) {
+        *where = "hci:" + std::to_string(index);
+        return fd;
+    }
+    close(fd);
+    return -1;
+}
+
+void sim_server_serve(int fd, int stop_fd, const SimControllerSettings& settings) {
+    SimAir air;
+    serve_connection(fd, stop_fd, &air, settings);
 }

@@ -67,7 +67,9 @@ final class Observer {
         {"the controller did not answer the sync either", "the controller did not answer Read Local Version"
                                                           + " Information, sent to get back in step after an unanswered command"},
     };
-    private static final Pattern HOST_LINE = Pattern.compile("E halvenor-host: (?:h4: )?(?:cannot reach )?(.*)");
+    private static final Pattern HOST_LINE = Pattern.compile("E halvenor-host: (?:h4: )?(?:cannot reach |cannot take )?(.*)");
+    // The host could not take the machine's adapter: the user's setup, not the controller, is at fault.
+    private static final String SETUP_LINE = "E halvenor-host: h4: cannot take ";
 
     private final Capture capture;
     private final Path logFile;
@@ -177,6 +179,11 @@ final class Observer {
             }
         }
         return null;
+    }
+
+    /** Whether, since the mark, the host could not take the machine's adapter (hci:N) as set up. */
+    synchronized boolean setupRefused(Mark from) {
+        return linesSince(from).stream().anyMatch(l -> l.startsWith(SETUP_LINE));
     }
 
     /** Why the controller is gone, once the host layer or the library has said so since the mark; else null. */

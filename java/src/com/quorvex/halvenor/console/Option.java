@@ -22,10 +22,11 @@ record Option(String name, String value, List<String> commands, List<String> req
 
     static final List<Command> COMMANDS = List.of(
         new Command("demo", "demo", "tour: Device Under Test mode on and off, a 1 s receiver test on every "
-                    + "frequency and PHY with its verdict, a continuous wave",
+                    + "frequency and PHY with its verdict, a transmitter test, a continuous wave",
                     "Device Under Test mode on, then off; a 1 s receiver test on 2402, 2440 and 2480 MHz, each on LE 1M"
-                    + " and LE 2M, with packets received, expected, PER and its verdict; the continuous-wave command"
-                    + " (channel 1, power 9, type 4) for 0.5 s, stopped with an HCI Reset."),
+                    + " and LE 2M, with packets received, expected, PER and its verdict; a 0.5 s transmitter test on"
+                    + " 2440 MHz LE 2M; the continuous-wave command (channel 1, power 9, type 4) for 0.5 s, stopped with"
+                    + " an HCI Reset."),
         new Command("dut on", "dut on", "enter classic Device Under Test mode",
                     "Enters classic Device Under Test mode: Enable Device Under Test Mode, Set Event Filter (auto-accept"
                     + " all connections), Write Scan Enable (inquiry and page scan), Write Authentication Enable (off),"
@@ -50,14 +51,17 @@ record Option(String name, String value, List<String> commands, List<String> req
                     + " an HCI Reset to stop the carrier."),
         new Command("sim", "sim", "a simulated controller for other processes (halvenor-sim)",
                     "Serves simulated controllers as H4 for other processes, one per connection, all on one air: a"
-                    + " transmitter test in one process is counted by a receiver test in another. --unix and --tcp"
-                    + " exclude each other. Prints the value to give --hci. Stop it with Ctrl-C or SIGTERM."),
+                    + " transmitter test in one process is counted by a receiver test in another; or, with --vhci,"
+                    + " one controller to this machine's kernel, as an adapter hciN. --unix, --tcp and --vhci exclude"
+                    + " each other. Prints the value to give --hci. Stop it with Ctrl-C or SIGTERM."),
         new Command("help", "help [COMMAND]", "this text, or a command's page", "Commands and options, or one command's page."));
 
     static final List<Option> ALL = List.of(
-        new Option("hci", "sim|none|unix:PATH|tcp:HOST:PORT|tty:DEVICE[,BAUD][,rtscts]", RUNS, List.of(),
+        new Option("hci", "sim|none|unix:PATH|tcp:HOST:PORT|tty:DEVICE[,BAUD][,rtscts]|hci:N", RUNS, List.of(),
                    "HALVENOR_HCI", Kind.HCI, 0, 0, "the controller (default: $HALVENOR_HCI, else sim, the simulated one;"
-                   + " none: a device without a Bluetooth HAL); rtscts turns on hardware flow control on a serial line"),
+                   + " none: a device without a Bluetooth HAL); rtscts turns on hardware flow control on a serial line;"
+                   + " hci:N is this machine's adapter hciN, taken from the kernel through its HCI user channel"
+                   + " (root, adapter down)"),
         new Option("hal", "hidl|aidl", RUNS, List.of(), "HALVENOR_HAL", Kind.HAL, 0, 0,
                    "the host Bluetooth HAL the library reaches the controller through (default: $HALVENOR_HAL, else"
                    + " hidl); a phone chooses for itself"),
@@ -93,6 +97,9 @@ record Option(String name, String value, List<String> commands, List<String> req
         new Option("unix", "PATH", List.of("sim"), List.of(), null, Kind.PATH, 0, 0, "listen on a unix socket"),
         new Option("tcp", "PORT", List.of("sim"), List.of(), null, Kind.PORT, 0, 65535,
                    "listen on 127.0.0.1:PORT, 0 to 65535 (the default; 0 picks a free port)"),
+        new Option("vhci", "DEVICE", List.of("sim"), List.of(), null, Kind.PATH, 0, 0,
+                   "serve one controller to this machine's kernel through DEVICE (/dev/vhci): it appears as an adapter,"
+                   + " for --hci hci:N (Linux, root)"),
         new Option("reftx", "0|1", List.of("sim"), List.of(), null, Kind.BIT, 0, 1,
                    "1: a reference transmitter follows every receiver test (default 0)"),
         new Option("loss", "FRACTION", List.of("sim"), List.of(), null, Kind.FRACTION, 0, 1,
@@ -120,7 +127,7 @@ record Option(String name, String value, List<String> commands, List<String> req
     String range() {
         return switch (kind) {
             case FLAG -> "no value";
-            case HCI -> "sim, none, unix:PATH, tcp:HOST:PORT or tty:DEVICE[,BAUD][,rtscts]";
+            case HCI -> "sim, none, unix:PATH, tcp:HOST:PORT, tty:DEVICE[,BAUD][,rtscts] or hci:N";
             case FILE -> "a file name";
             case FREQ -> "2402 (ch 0), 2440 (ch 19) or 2480 (ch 39)";
             case PHY -> "1M or 2M";

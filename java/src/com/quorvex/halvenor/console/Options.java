@@ -27,7 +27,7 @@ final class Options {
     static final double DEFAULT_LIMIT_PERCENT = 30.8;
     static final long DEFAULT_MIN_PACKETS = 1500;
     private static final Pattern HCI = Pattern.compile(
-            "sim|none|unix:.+|tcp:[^:]+:([1-9][0-9]{0,4})|tty:([^,]+)((,[^,]+)*)");
+            "sim|none|unix:.+|tcp:[^:]+:([1-9][0-9]{0,4})|tty:([^,]+)((,[^,]+)*)|hci:([0-9]{1,9})");
     private static final Set<Integer> BAUDS = Set.of(9600, 19200, 38400, 57600, 115200, 230400, 460800, 500000,
                                                      921600, 1000000, 1500000, 2000000, 3000000, 4000000);
     private static final String COMMANDS = "demo, dut on, dut off, tx, rx, sweep, cw, sim or help";
@@ -206,6 +206,9 @@ final class Options {
         Matcher m = HCI.matcher(value);
         if (!m.matches() || (m.group(1) != null && Integer.parseInt(m.group(1)) > 65535)) {
             throw new UsageException("bad " + source + " '" + value + "': expected " + Option.named("hci").range());
+        }
+        if (m.group(5) != null && Integer.parseInt(m.group(5)) > 65534) {
+            throw new UsageException("bad " + source + " '" + value + "': adapter index " + m.group(5) + " is not in 0..65534");
         }
         String fields = m.group(3);
         for (String field : fields == null || fields.isEmpty() ? new String[0] : fields.substring(1).split(",")) {

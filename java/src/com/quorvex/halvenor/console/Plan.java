@@ -8,6 +8,7 @@ final class Plan {
     /** 1600 packets a second from the reference transmitter: a second is enough for a verdict. */
     static final double DEMO_RX_SECONDS = 1;
     static final double DEMO_CW_SECONDS = 0.5;
+    static final double DEMO_TX_SECONDS = 0.5;
     /** The demo's continuous wave: channel 1, power 9, type 4. */
     static final int[] DEMO_CW = {1, 9, 4};
 
@@ -47,6 +48,7 @@ final class Plan {
         items.add(r -> r.dutOn(0));
         items.add(Runner::dutOff);
         sweep(items, true, DEMO_RX_SECONDS, null, Runner.DEFAULT_WINDOW_S);
+        items.add(r -> r.tx(Band.F2440, Phy.LE_2M, DEMO_TX_SECONDS));
         items.add(r -> r.cw(DEMO_CW[0], DEMO_CW[1], DEMO_CW[2], DEMO_CW_SECONDS));
     }
 }

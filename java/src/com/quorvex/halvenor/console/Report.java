@@ -16,6 +16,7 @@ import java.util.Map;
 final class Report {
     static final int EXIT_OK = 0;
     static final int EXIT_FAILED = 1;
+    static final int EXIT_SETUP = 2;  // as a bad command line
     static final int EXIT_LIMIT = 3;
     static final int EXIT_INCONCLUSIVE = 4;
     private static final String[] HEADER = {"STEP", "SETTING", "COUNT", "PER [95% CI]", "VERDICT", "RESULT"};
@@ -89,9 +90,15 @@ final class Report {
         }
     }
 
-    /** The most severe outcome: a step that could not run, then a limit failed, then an inconclusive verdict. */
+    /**
+     * The most severe outcome: an adapter the setup kept from being taken (as a bad value
+     * would), a step that could not run, then a limit failed, then an inconclusive verdict.
+     */
     int exitStatus() {
         synchronized (out) {
+            if (written && steps.stream().anyMatch(s -> !s.ok && s.setupRefused)) {
+                return EXIT_SETUP;
+            }
             if (!written || steps.stream().anyMatch(s -> !s.ok)) {
                 return EXIT_FAILED;
             }

@@ -218,6 +218,7 @@ final class Runner {
                 why += ", though the library confirmed " + what;
             }
             s.unreachable = exchanges.isEmpty();
+            s.setupRefused = s.unreachable && observer.setupRefused(s.mark);
             s.fail(why);
             return false;
         }

@@ -44,6 +44,8 @@ final class Step {
     volatile String error;
     /** Nothing reached a controller: later steps would fail the same way. */
     boolean unreachable;
+    /** The machine's adapter could not be taken as it is set up (down, permissions): the user's to fix. */
+    boolean setupRefused;
     volatile boolean interrupted;
 
     Step(String name, String setting) {
