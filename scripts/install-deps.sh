@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
 # Installs the Debian packages the console needs (runtime), or those and the
-# ones the tests add (test, the default). Runs apt-get update only when
+# ones the tests add (test, the default), or only the test VM's (vm). Runs apt-get update only when
 # something is missing.
 set -euo pipefail
 
@@ -19,10 +19,14 @@ test=(
   soong mini-soong
   cloc
 )
+# The VM the user-channel test boots (scripts/kernel-vm.sh): this machine's
+# kernel has no Bluetooth, Debian's has it as modules.
+vm=(qemu-system-x86 linux-image-amd64 busybox-static xz-utils)
 case ${1:-test} in
   runtime) packages=("${runtime[@]}") ;;
-  test) packages=("${runtime[@]}" "${test[@]}") ;;
-  *) echo "usage: install-deps.sh [runtime|test]" >&2; exit 2 ;;
+  test) packages=("${runtime[@]}" "${test[@]}" "${vm[@]}") ;;
+  vm) packages=("${vm[@]}") ;;
+  *) echo "usage: install-deps.sh [runtime|test|vm]" >&2; exit 2 ;;
 esac
 
 missing=()
@@ -39,4 +43,6 @@ if [ "$(id -u)" -ne 0 ]; then
 fi
 export DEBIAN_FRONTEND=noninteractive
 apt-get update -qq
-apt-get install -y -qq --no-install-recommends "${missing[@]}"
+# The kernel is only booted in a VM with an initramfs of its own: building the
+# host's (INITRD=No skips it) would only cost time.
+INITRD=No apt-get install -y -qq --no-install-recommends "${missing[@]}"

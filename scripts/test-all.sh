@@ -2,8 +2,10 @@
 # Builds and runs every test: the plain build (C++ and JVM suites), the checks
 # of Android.bp (bpfix, a mini-soong build and its exports), the C++
 # suites under AddressSanitizer + UndefinedBehaviorSanitizer, the threaded
-# suites under ThreadSanitizer, and the C++ suites cross-built for aarch64 under
-# qemu (scripts/test-aarch64.sh). Fails on any failing test or sanitizer report.
+# suites under ThreadSanitizer, the C++ suites cross-built for aarch64 under
+# qemu (scripts/test-aarch64.sh), and the console on a real kernel's HCI user
+# channel in a VM (scripts/kernel-vm.sh, tests/vm/user_channel.sh). Fails on
+# any failing test or sanitizer report, and when the VM cannot start.
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
 bash "$root/scripts/install-deps.sh" test
@@ -41,6 +43,10 @@ bash "$root/scripts/fuzz.sh" 30
 
 step "aarch64 cross build and C++ suites under qemu-aarch64"
 bash "$root/scripts/test-aarch64.sh"
+
+step "the kernel's HCI user channel, in a VM with Debian's kernel (about 40 s)"
+bash "$root/scripts/kernel-vm.sh" --timeout 150 --env HALVENOR_BUILD_DIR="$root/build/main" --env HALVENOR_NO_BUILD=1 \
+  -- bash "$root/tests/vm/user_channel.sh"
 
 echo
 echo "all test runs passed"
