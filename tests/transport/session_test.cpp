@@ -196,6 +196,21 @@ TEST_P(SessionTest, LateAnswerToAnAbandonedOpeningIsIgnored) {
     EXPECT_FALSE(opened);
 }
 
+// A HAL that dies before it answers ends the opening's wait at once, not
+// after its 10 s bound.
+TEST_P(SessionTest, DeathDuringTheOpeningEndsItsWait) {
+    std::shared_ptr<HalScript> hal = installHal(InitMode::Never);
+    bool opened = true;
+    std::thread opener([&] { opened = hidl_client_initialize(0, &bt_fd); });
+    ASSERT_TRUE(hal->waitForInitialize());
+    auto died = std::chrono::steady_clock::now();
+    hal->die();
+    opener.join();
+    EXPECT_FALSE(opened);
+    EXPECT_LT(std::chrono::steady_clock::now() - died, std::chrono::seconds(5));
+    EXPECT_TRUE(logged("serviceDied: the Bluetooth HAL died"));
+}
+
 // Events from several HAL threads at once: each arrives whole, and each
 // thread's events keep their order.
 TEST_P(SessionTest, ConcurrentCallbacksNeverInterleavePackets) {
