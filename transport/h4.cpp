@@ -8,10 +8,8 @@
 
 #include "transport/log.h"
 
-const int preamble_len_table[4] = {3, 4, 3, 2};
-
 int get_payload_len(uint8_t type, const uint8_t* preamble) {
-    if (type < H4_TYPE_COMMAND || type > H4_TYPE_EVENT) {
+    if (h4_header_len(type) == 0) {
         LOGE("%s: Unsupported packet type, failed to get length", "get_payload_len");
         return -1;
     }

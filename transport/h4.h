@@ -6,10 +6,8 @@
 
 #include "transport/h4_frame.h"
 
-// Preamble length of types 1 to 4, indexed by type minus 1.
-extern const int preamble_len_table[4];
-
-// Payload length from the type and the preamble, or -1 (logged) for a type outside 1..4.
+// Payload length from the type and the preamble, or -1 (logged) for a byte
+// that starts no packet (types 1 to 5 do).
 int get_payload_len(uint8_t type, const uint8_t* preamble);
 
 // Move exactly len bytes; len on success, 0 for len <= 0, -1 on failure.

@@ -32,12 +32,11 @@ struct HalAdapter {
     HalSend (*send)(uint8_t type, const uint8_t* packet, size_t len);
     // Whether the service takes packets of this H4 type from the library.
     bool (*takes)(uint8_t type);
-    // Closes the service when `close` is set, then releases it; a failed close
-    // is logged with `caller`.
-    void (*release)(bool close, const char* caller);
-    // Whether a failed initialisation left the service to someone else, so
-    // that it must be released without closing it.
-    bool (*in_use)();
+    // Closes the service and releases it; a failed close is logged with
+    // `caller`, when given. A service that answered it is held by another
+    // client is never closed: that would take the HAL from a running
+    // Bluetooth stack.
+    void (*release)(const char* caller);
 };
 
 extern const HalAdapter hidl_hal;

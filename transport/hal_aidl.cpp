@@ -129,10 +129,10 @@ HalSend send_aidl(uint8_t type, const uint8_t* packet, size_t len) {
 
 bool takes_aidl(uint8_t type) { return (type >= H4_TYPE_COMMAND && type <= H4_TYPE_SCO) || type == H4_TYPE_ISO; }
 
-void release_aidl(bool close, const char* caller) {
+void release_aidl(const char* caller) {
     if (service == nullptr) return;
     AIBinder_unlinkToDeath(service->asBinder().get(), death.get(), death_cookie);
-    if (close) {
+    if (!in_use) {
         ScopedAStatus closed = service->close();
         if (!closed.isOk() && caller != nullptr) {
             LOGI("%s: the AIDL HAL's close failed: %s", caller, closed.getDescription().c_str());
@@ -140,8 +140,6 @@ void release_aidl(bool close, const char* caller) {
     }
     service.reset();
 }
-
-bool in_use_aidl() { return in_use; }
 
 }  // namespace
 
@@ -163,5 +161,4 @@ const HalAdapter aidl_hal = {
         send_aidl,
         takes_aidl,
         release_aidl,
-        in_use_aidl,
 };

@@ -90,10 +90,6 @@ bool initialize_hidl() {
 // Every session change joins the pump before it touches btHci, so the
 // service read here is the one this session opened.
 HalSend send_hidl(uint8_t type, const uint8_t* packet, size_t len) {
-    if (btHci == nullptr) {
-        LOGE("%s: no HAL service, packet dropped", "process_tool_data");
-        return HAL_SENT;
-    }
     hidl_vec<uint8_t> hci;
     hci.setToExternal(const_cast<uint8_t*>(packet), len);
     Return<void> sent = type == H4_TYPE_COMMAND ? btHci->sendHciCommand(hci)
@@ -107,18 +103,14 @@ HalSend send_hidl(uint8_t type, const uint8_t* packet, size_t len) {
 bool takes_hidl(uint8_t type) { return type >= H4_TYPE_COMMAND && type <= H4_TYPE_SCO; }
 
 // A dead service's unlink and close fail; there is nothing left to undo then.
-void release_hidl(bool close, const char* caller) {
+void release_hidl(const char* caller) {
     if (btHci == nullptr) return;
     Return<bool> unlinked = btHci->unlinkToDeath(hal_death);
     unlinked.isOk();
-    if (close) {
-        Return<void> closed = btHci->close();
-        if (!closed.isOk() && caller != nullptr) LOGI("%s: HIDL daemon is dead", caller);
-    }
+    Return<void> closed = btHci->close();
+    if (!closed.isOk() && caller != nullptr) LOGI("%s: HIDL daemon is dead", caller);
     btHci.clear();
 }
-
-bool in_use_hidl() { return false; }
 
 }  // namespace
 
@@ -130,5 +122,4 @@ const HalAdapter hidl_hal = {
         send_hidl,
         takes_hidl,
         release_hidl,
-        in_use_hidl,
 };

@@ -14,7 +14,6 @@
 #include "transport/log.h"
 #include "transport/session.h"
 
-
 struct timeval timeout;
 
 enum WaitResult { WAIT_READABLE, WAIT_TIMED_OUT, WAIT_FAILED };
@@ -114,8 +113,7 @@ static bool read_packet(int fd, uint8_t* type, std::vector<uint8_t>& packet) {
         LOGE("%s: failed to read the packet from tools", "process_tool_data");
         return false;
     }
-    int payload_len = *type == H4_TYPE_ISO ? static_cast<int>(h4_payload_len(*type, preamble))
-                                           : get_payload_len(*type, preamble);
+    int payload_len = get_payload_len(*type, preamble);
     if (payload_len < 0) {
         LOGE("%s: Invalid payload length ", "process_tool_data");
         return false;

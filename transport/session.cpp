@@ -57,6 +57,14 @@ static void make_init_done() {
     pthread_condattr_destroy(&attr);
 }
 
+// Ends the opening's wait for the HAL; init_lock is held.
+static void end_init_wait_locked(bool ready) {
+    hidl_ready = ready;
+    session.init_answered = true;
+    session.init_waiter = nullptr;
+    pthread_cond_broadcast(&init_done);
+}
+
 void session_expect_initialized(const void* waiter) {
     pthread_mutex_lock(&init_lock);
     hidl_ready = false;
@@ -70,12 +78,7 @@ void session_expect_initialized(const void* waiter) {
 void session_initialized(const void* waiter, bool ok) {
     pthread_mutex_lock(&init_lock);
     bool current = waiter != nullptr && waiter == session.init_waiter;
-    if (current) {
-        hidl_ready = ok;
-        session.init_answered = true;
-        session.init_waiter = nullptr;
-        pthread_cond_broadcast(&init_done);
-    }
+    if (current) end_init_wait_locked(ok);
     pthread_mutex_unlock(&init_lock);
     if (!current) LOGE("%s: answer to an abandoned opening ignored", "initializationComplete");
 }
@@ -88,12 +91,7 @@ void session_hal_died(uint64_t cookie) {
     bool current = cookie == session.cookie;
     if (current) {
         LOGE("%s: the Bluetooth HAL died", "serviceDied");
-        if (session.init_waiter != nullptr) {
-            session.init_waiter = nullptr;
-            session.init_answered = true;
-            hidl_ready = false;
-            pthread_cond_broadcast(&init_done);
-        }
+        if (session.init_waiter != nullptr) end_init_wait_locked(false);
     }
     pthread_mutex_unlock(&init_lock);
     if (!current) return;  // an earlier session's service
@@ -154,7 +152,7 @@ static void end_session(const char* caller, bool close_tool_end, const char* lin
     if (close_tool_end) hidl_client_close_tool_end();
     stop_bridge();
     if (line != nullptr) LOGI(line, caller);
-    if (session.hal != nullptr) session.hal->release(true, caller);
+    if (session.hal != nullptr) session.hal->release(caller);
     session.hal = nullptr;
 }
 
@@ -175,9 +173,8 @@ static bool wait_for_init() {
     return answered && ready;
 }
 
-// A failed opening gives back the service it obtained, closed when it was
-// handed callbacks, unless it answered that someone else holds it: taking the
-// HAL from a running Bluetooth stack by closing it is never the library's to do.
+// A failed opening gives back the service it obtained, closed (the adapter
+// leaves a HAL that another client holds unclosed).
 static bool open_hal(const HalAdapter* hal) {
     pthread_once(&init_done_made, make_init_done);
     pthread_mutex_lock(&init_lock);
@@ -191,7 +188,7 @@ static bool open_hal(const HalAdapter* hal) {
     }
     session_expect_initialized(nullptr);
     LOGE(hal->failed_line, "hidl_client_initialize");
-    hal->release(!hal->in_use(), nullptr);
+    hal->release(nullptr);
     session.hal = nullptr;
     return false;
 }

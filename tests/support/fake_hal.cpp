@@ -111,7 +111,7 @@ void FakeHal::die() {
 }
 
 sp<FakeHal::Callbacks> FakeHal::callbacks() {
-    std::lock_guard<std::mutex> guard(lock_);
+    std::lock_guard<std::mutex> guard(callbacks_lock_);
     return callbacks_;
 }
 
@@ -124,7 +124,7 @@ FakeHal::Return<bool> FakeHal::linkToDeath(const sp<android::hardware::hidl_deat
 FakeHal::Return<void> FakeHal::initialize(const sp<Callbacks>& callback) {
     if (diesAt(Call::Initialize)) return deadObject();
     {
-        std::lock_guard<std::mutex> guard(lock_);
+        std::lock_guard<std::mutex> guard(callbacks_lock_);
         callbacks_ = callback;
     }
     initialized([callback](int status) { callback->initializationComplete(static_cast<Status>(status)); });
@@ -180,14 +180,14 @@ void FakeAidlHal::die() {
 }
 
 std::shared_ptr<FakeAidlHal::Callbacks> FakeAidlHal::callbacks() {
-    std::lock_guard<std::mutex> guard(lock_);
+    std::lock_guard<std::mutex> guard(callbacks_lock_);
     return callbacks_;
 }
 
 ScopedAStatus FakeAidlHal::initialize(const std::shared_ptr<Callbacks>& callback) {
     if (diesAt(Call::Initialize)) return ScopedAStatus::fromStatus(STATUS_DEAD_OBJECT);
     {
-        std::lock_guard<std::mutex> guard(lock_);
+        std::lock_guard<std::mutex> guard(callbacks_lock_);
         callbacks_ = callback;
     }
     initialized([callback](int status) { callback->initializationComplete(static_cast<Status>(status)); });

@@ -118,7 +118,7 @@ class FakeHal : public android::hardware::bluetooth::V1_0::IBluetoothHci, public
     android::sp<Callbacks> callbacks();
     Return<void> send(uint8_t type, const android::hardware::hidl_vec<uint8_t>& p);
 
-    std::mutex lock_;
+    std::mutex callbacks_lock_;
     android::sp<Callbacks> callbacks_;
 };
 
@@ -150,6 +150,6 @@ class FakeAidlHal : public aidl::android::hardware::bluetooth::BnBluetoothHci, p
     std::shared_ptr<Callbacks> callbacks();
     ndk::ScopedAStatus send(uint8_t type, const std::vector<uint8_t>& p);
 
-    std::mutex lock_;
+    std::mutex callbacks_lock_;
     std::shared_ptr<Callbacks> callbacks_;
 };

@@ -13,7 +13,7 @@ import java.util.stream.Stream;
 public final class Main {
     static final int EXIT_OK = Report.EXIT_OK;
     static final int EXIT_FAILED = Report.EXIT_FAILED;
-    static final int EXIT_USAGE = 2;
+    static final int EXIT_USAGE = Report.EXIT_USAGE;
     /** A signal ends the process within 3 s, whatever the controller does. */
     private static final long INTERRUPT_BOUND_MS = 2_500;
 

@@ -45,16 +45,18 @@ final class Observer {
     /** A place in what has been observed; a step or a window looks at what comes after it. */
     record Mark(int packet, int line) {}
 
+    private static final String HAL_DIED_LINE = "E halvenor: serviceDied: the Bluetooth HAL died";
+    private static final String HAL_DIED = "the Bluetooth HAL died";
     // Library and host lines that say in a person's words why a command went unanswered.
     private static final String[][] CAUSES = {
         {"E halvenor: Unable to initialize the HIDL", "no Bluetooth HAL service"},
-        {"E halvenor: serviceDied: the Bluetooth HAL died", "the Bluetooth HAL died"},
+        {HAL_DIED_LINE, HAL_DIED},
         {"E halvenor: hidl_client_initialize: no answer from the HAL", "the Bluetooth HAL did not finish initializing"},
         {"E halvenor: Error in HIDL initialization", "the Bluetooth HAL failed to initialize"},
         // A cause ending in ": " takes the rest of the line: the AIDL HAL's status, in words.
         {"E halvenor: initializationComplete: the AIDL HAL failed to initialize: ", "the Bluetooth HAL failed to initialize: "},
         {"E halvenor: hidl_client_initialize: AIDL initialize failed: ", "the Bluetooth HAL failed to initialize: "},
-        {"E halvenor: hidl_client_initialize: the AIDL HAL died before initialize", "the Bluetooth HAL died"},
+        {"E halvenor: hidl_client_initialize: the AIDL HAL died before initialize", HAL_DIED},
         {" is declared but not running", "the AIDL Bluetooth HAL is declared but not running"},
         {"E halvenor: read_incoming_events: timed out after 2000 ms waiting for the packet type", TIMED_OUT},
         {"E halvenor: read_incoming_events: timed out after 2000 ms waiting for the ",
@@ -194,8 +196,8 @@ final class Observer {
             if (line.startsWith("E halvenor-host: h4: ") && host.matches()) {
                 return host.group(1);
             }
-            if (line.equals(CAUSES[1][0])) {
-                return CAUSES[1][1];
+            if (line.equals(HAL_DIED_LINE)) {
+                return HAL_DIED;
             }
         }
         return null;

@@ -4,7 +4,6 @@
 package com.quorvex.halvenor.console;
 
 import java.util.List;
-import java.util.Locale;
 
 record Option(String name, String value, List<String> commands, List<String> requiredBy, String env, Kind kind,
               double min, double max, String help) {
@@ -163,7 +162,7 @@ record Option(String name, String value, List<String> commands, List<String> req
             case FRACTION -> Numbers.decimal(text, 0, 1);
             case BURST -> Numbers.decimal(text, 1, 1000);
             case SEED -> text.matches("[0-9]{1,19}") ? text : null;
-            case HAL -> text.toLowerCase(Locale.ROOT).matches("hidl|aidl") ? text.toLowerCase(Locale.ROOT) : null;
+            case HAL -> text.equals("hidl") || text.equals("aidl") ? text : null;  // as the host layer reads it
         };
         if (v == null) {
             throw bad(text);

@@ -227,29 +227,21 @@ final class Options {
     }
 
     /**
-     * The library reads HALVENOR_HCI and HALVENOR_BTSNOOP from the process environment,
-     * which a running JVM cannot change: the launcher exports them before the JVM starts.
-     * Both are checked here whichever way they were given, before anything runs.
+     * The library and the host layer read HALVENOR_HCI, HALVENOR_HAL and HALVENOR_BTSNOOP
+     * from the process environment, which a running JVM cannot change: the launcher exports
+     * them before the JVM starts. Each is checked here whichever way it was given, before
+     * anything runs.
      */
     void checkEnvironment(Map<String, String> env) throws UsageException {
         if (env.get("HALVENOR_CONSOLE_CAPTURE") == null || env.get("HALVENOR_LOG_FILE") == null) {
             throw new UsageException("the console runs through its launcher: ./halvenor " + command);
         }
-        String envHci = env.getOrDefault("HALVENOR_HCI", "");
-        envHci = envHci.isEmpty() ? "sim" : envHci;
-        String given = text("hci");
-        if (given != null && !given.equals(envHci)) {
-            throw new UsageException("--hci " + given + " must be given to the ./halvenor launcher, which sets HALVENOR_HCI"
-                                     + " (the library sees '" + envHci + "')");
+        hci = checkHci(text("hci") != null ? "--hci" : "HALVENOR_HCI", launcherValue(env, "hci", "sim"));
+        btsnoop = launcherValue(env, "btsnoop", null);
+        hal = launcherValue(env, "hal", "hidl");
+        if (!hal.matches("hidl|aidl")) {  // a --hal given here has been checked already
+            throw new UsageException("bad HALVENOR_HAL '" + hal + "': expected " + Option.named("hal").range());
         }
-        hci = checkHci(given != null ? "--hci" : "HALVENOR_HCI", envHci);
-        String envSnoop = env.get("HALVENOR_BTSNOOP");
-        if (text("btsnoop") != null && !text("btsnoop").equals(envSnoop)) {
-            throw new UsageException("--btsnoop " + text("btsnoop") + " must be given to the ./halvenor launcher,"
-                                     + " which sets HALVENOR_BTSNOOP");
-        }
-        btsnoop = envSnoop == null || envSnoop.isEmpty() ? null : envSnoop;
-        hal = checkHal(env.getOrDefault("HALVENOR_HAL", ""));
         if (hci.equals("sim")) {
             String[][] settings = {{"reftx", "1"}, {"loss", "0"}, {"burst", "1"}, {"seed", "0"}, {"delay", "0"}};
             for (String[] setting : settings) {
@@ -259,19 +251,20 @@ final class Options {
         }
     }
 
-    private String checkHal(String envHal) throws UsageException {
-        String value = envHal.isEmpty() ? "hidl" : envHal;
-        String given = text("hal");
-        if (given != null && !given.equalsIgnoreCase(value)) {
-            throw new UsageException("--hal " + given + " must be given to the ./halvenor launcher, which sets HALVENOR_HAL"
-                                     + " (the library sees '" + value + "')");
+    /**
+     * The value the launcher exported for the option (`fallback` when unset or empty); one
+     * given on the command line must be the same, or the library would see another.
+     */
+    private String launcherValue(Map<String, String> env, String option, String fallback) throws UsageException {
+        String variable = Option.named(option).env();
+        String value = env.getOrDefault(variable, "");
+        value = value.isEmpty() ? fallback : value;
+        String given = text(option);
+        if (given != null && !given.equals(value)) {
+            throw new UsageException("--" + option + " " + given + " must be given to the ./halvenor launcher, which sets "
+                                     + variable + (value == null ? "" : " (the library sees '" + value + "')"));
         }
-        String hal = value.toLowerCase(Locale.ROOT);
-        if (!hal.matches("hidl|aidl")) {
-            throw new UsageException("bad " + (given != null ? "--hal" : "HALVENOR_HAL") + " '" + value + "': expected "
-                                     + Option.named("hal").range());
-        }
-        return hal;
+        return value;
     }
 
     /**

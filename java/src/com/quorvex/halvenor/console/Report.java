@@ -16,7 +16,7 @@ import java.util.Map;
 final class Report {
     static final int EXIT_OK = 0;
     static final int EXIT_FAILED = 1;
-    static final int EXIT_SETUP = 2;  // as a bad command line
+    static final int EXIT_USAGE = 2;  // a bad command line, or a setup that keeps the adapter from being taken
     static final int EXIT_LIMIT = 3;
     static final int EXIT_INCONCLUSIVE = 4;
     private static final String[] HEADER = {"STEP", "SETTING", "COUNT", "PER [95% CI]", "VERDICT", "RESULT"};
@@ -97,7 +97,7 @@ final class Report {
     int exitStatus() {
         synchronized (out) {
             if (written && steps.stream().anyMatch(s -> !s.ok && s.setupRefused)) {
-                return EXIT_SETUP;
+                return EXIT_USAGE;
             }
             if (!written || steps.stream().anyMatch(s -> !s.ok)) {
                 return EXIT_FAILED;
